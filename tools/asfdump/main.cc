@@ -1,0 +1,61 @@
+// asfdump: the reference host's command line. Loads libplimo_asf.so as the
+// framework does and drives its descriptor.
+#include <unistd.h>
+
+#include <climits>
+#include <cstdio>
+#include <cstdlib>
+#include <string>
+
+#include "commands.h"
+#include "loader.h"
+#include "options.h"
+
+namespace {
+
+std::string self_path(const char* argv0) {
+    char buf[PATH_MAX];
+    ssize_t n = readlink("/proc/self/exe", buf, sizeof buf - 1);
+    if (n > 0) return std::string(buf, static_cast<size_t>(n));
+    return argv0;
+}
+
+bool load_plugin(host::PluginLoader& loader, const asfdump::Options& opts, const char* argv0) {
+    if (!opts.plugin.empty()) {
+        if (loader.load(opts.plugin)) return true;
+        std::fprintf(stderr, "asfdump: %s\n", loader.error().c_str());
+        return false;
+    }
+    std::string last;
+    for (const std::string& path : host::PluginLoader::default_paths(self_path(argv0))) {
+        if (access(path.c_str(), R_OK) != 0) continue;
+        if (loader.load(path)) return true;
+        last = loader.error();
+    }
+    std::fprintf(stderr, "asfdump: cannot load libplimo_asf.so%s%s\n", last.empty() ? "" : ": ",
+                 last.c_str());
+    return false;
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+    asfdump::Options opts;
+    std::string error;
+    if (!asfdump::parse_options(argc, argv, &opts, &error)) {
+        if (!error.empty()) std::fprintf(stderr, "asfdump: %s\n", error.c_str());
+        std::fputs(asfdump::usage_text(), stderr);
+        return asfdump::kExitUsage;
+    }
+    if (access(opts.file.c_str(), R_OK) != 0) {
+        std::fprintf(stderr, "asfdump: cannot read %s\n", opts.file.c_str());
+        return asfdump::kExitUnreadable;
+    }
+    host::PluginLoader loader;
+    if (!load_plugin(loader, opts, argv[0])) return asfdump::kExitOpenFailed;
+    const hova_dmx_func_st* dmx = loader.descriptor();
+
+    if (opts.command == "probe") return asfdump::run_probe(dmx, opts);
+    std::fprintf(stderr, "asfdump: %s is not available yet\n", opts.command.c_str());
+    return asfdump::kExitUsage;
+}

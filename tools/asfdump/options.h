@@ -1,0 +1,41 @@
+// Command line of asfdump: the command, the file and the input and play options.
+#pragma once
+
+#include <cstdint>
+#include <string>
+
+#include "raw_input.h"
+
+namespace asfdump {
+
+struct Options {
+    std::string command;
+    std::string file;
+    std::string plugin;  // --plugin PATH
+    host::InputOptions input;
+    int ring_size = 1048576;
+    bool not_seekable = false;
+    // play options
+    bool has_seek = false;
+    int64_t seek_us = 0;
+    bool backward = false;
+    bool query = false;
+    bool has_resync = false;
+    int64_t resync_us = 0;
+    bool has_thumbnail = false;
+    int64_t thumbnail_us = 0;
+    bool no_audio = false;
+    bool no_video = false;
+    int64_t max_frames = -1;
+    std::string dump_dir;
+    bool log = false;
+};
+
+// Parses argv; on a usage error returns false with a message in `error`.
+bool parse_options(int argc, char** argv, Options* out, std::string* error);
+
+const char* usage_text();
+
+enum ExitCode { kExitOk = 0, kExitOpenFailed = 1, kExitUsage = 2, kExitUnreadable = 3 };
+
+}  // namespace asfdump
