@@ -17,12 +17,10 @@ char priority_letter(int prio) {
     return (prio >= 0 && prio <= ANDROID_LOG_SILENT) ? kLetters[prio] : '?';
 }
 
+// Read on every message so that a host can silence the log at any time.
 bool stderr_enabled() {
-    static const bool enabled = [] {
-        const char* v = std::getenv("PLIMO_LOG");
-        return !(v && std::strcmp(v, "off") == 0);
-    }();
-    return enabled;
+    const char* v = std::getenv("PLIMO_LOG");
+    return !(v && std::strcmp(v, "off") == 0);
 }
 
 }  // namespace
