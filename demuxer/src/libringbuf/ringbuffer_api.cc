@@ -1,0 +1,245 @@
+#include "ringbuffer_api.h"
+
+#include <string.h>
+#include <time.h>
+
+namespace {
+
+// Deadline in whole calendar seconds: a wait ends at the latest at the start
+// of the tenth second after the call, and every new wait starts a new one.
+int rb_cond_timed_wait(rb_cond_t* cond, rb_mutex_t* mutex) {
+    struct timespec deadline;
+    deadline.tv_sec = time(nullptr) + SYS_RINGBUFFER_WAIT_S;
+    deadline.tv_nsec = 0;
+    return pthread_cond_timedwait(cond, mutex, &deadline);
+}
+
+// pkt_cnt and buf_eos are read without the lock by single-thread callers and
+// by the reader's in-buffer test, so every access goes through atomics.
+inline uint32_t load_cnt(const sys_ringbuffer* rb) {
+    return __atomic_load_n(&rb->pkt_cnt, __ATOMIC_ACQUIRE);
+}
+inline void store_cnt(sys_ringbuffer* rb, uint32_t v) {
+    __atomic_store_n(&rb->pkt_cnt, v, __ATOMIC_RELEASE);
+}
+inline void store_eos(sys_ringbuffer* rb, int16_t v) {
+    __atomic_store_n(&rb->buf_eos, v, __ATOMIC_RELEASE);
+}
+inline int16_t load_eos(const sys_ringbuffer* rb) {
+    return __atomic_load_n(&rb->buf_eos, __ATOMIC_ACQUIRE);
+}
+
+void copy_in(sys_ringbuffer* rb, const uint8_t* src, uint32_t len) {
+    const uint32_t tail = rb->size - rb->pwrite;
+    if (len > tail) {
+        memcpy(rb->data + rb->pwrite, src, tail);
+        memcpy(rb->data, src + tail, len - tail);
+        rb->pwrite = len - tail;
+    } else {
+        memcpy(rb->data + rb->pwrite, src, len);
+        rb->pwrite += len;
+        if (rb->pwrite == rb->size) rb->pwrite = 0;
+    }
+}
+
+}  // namespace
+
+int32_t sys_ringbuffer_free_internal(const sys_ringbuffer* rb) {
+    if (rb->pread > rb->pwrite) return static_cast<int32_t>(rb->pread - rb->pwrite - 1);
+    return static_cast<int32_t>(rb->pread + rb->size - rb->pwrite - 1);
+}
+
+int32_t sys_ringbuffer_avail_internal(const sys_ringbuffer* rb) {
+    if (rb->pwrite >= rb->pread) return static_cast<int32_t>(rb->pwrite - rb->pread);
+    return static_cast<int32_t>(rb->pwrite + rb->size - rb->pread);
+}
+
+void sys_ringbuffer_init(sys_ringbuffer* rb, uint8_t* data, uint32_t len) {
+    rb->data = data;
+    rb->size = len;
+    rb->pread = 0;
+    rb->pwrite = 0;
+    store_cnt(rb, 0);
+    store_eos(rb, 0);
+    rb->wsize_req = 0;
+    rb->rsize_req = 0;
+    rb->error = 0;
+    rb->rlock = 0;
+    rb->wlock = 0;
+    __atomic_store_n(&rb->slock, 0, __ATOMIC_RELAXED);
+    rb->srlock = 0;
+    pthread_mutex_init(&rb->ring_mutex, nullptr);
+    pthread_cond_init(&rb->ring_avail_cond, nullptr);
+    pthread_cond_init(&rb->ring_free_cond, nullptr);
+}
+
+void sys_ringbuffer_destroy(sys_ringbuffer* rb) {
+    pthread_cond_destroy(&rb->ring_avail_cond);
+    pthread_cond_destroy(&rb->ring_free_cond);
+    pthread_mutex_destroy(&rb->ring_mutex);
+}
+
+void sys_ringbuffer_close(sys_ringbuffer* rb) {
+    pthread_mutex_lock(&rb->ring_mutex);
+    store_eos(rb, 1);
+    store_cnt(rb, 0);
+    rb->pread = rb->pwrite;
+    rb->error = 0;
+    pthread_cond_signal(&rb->ring_avail_cond);
+    pthread_cond_signal(&rb->ring_free_cond);
+    pthread_mutex_unlock(&rb->ring_mutex);
+}
+
+int sys_ringbuffer_empty(sys_ringbuffer* rb) {
+    return rb->pread == rb->pwrite ? 1 : 0;
+}
+
+int32_t sys_ringbuffer_free(sys_ringbuffer* rb) {
+    pthread_mutex_lock(&rb->ring_mutex);
+    const int32_t n = sys_ringbuffer_free_internal(rb);
+    pthread_mutex_unlock(&rb->ring_mutex);
+    return n;
+}
+
+int32_t sys_ringbuffer_avail(sys_ringbuffer* rb) {
+    pthread_mutex_lock(&rb->ring_mutex);
+    const int32_t n = sys_ringbuffer_avail_internal(rb);
+    pthread_mutex_unlock(&rb->ring_mutex);
+    return n;
+}
+
+void sys_ringbuffer_flush(sys_ringbuffer* rb) {
+    pthread_mutex_lock(&rb->ring_mutex);
+    store_cnt(rb, 0);
+    rb->error = 1;
+    rb->pread = rb->pwrite;
+    pthread_cond_signal(&rb->ring_avail_cond);
+    pthread_cond_signal(&rb->ring_free_cond);
+    pthread_mutex_unlock(&rb->ring_mutex);
+}
+
+void sys_ringbuffer_reset_locked(sys_ringbuffer* rb) {
+    store_cnt(rb, 0);
+    rb->pread = 0;
+    rb->pwrite = 0;
+    store_eos(rb, 0);
+    __atomic_store_n(&rb->slock, 0, __ATOMIC_RELAXED);
+    pthread_cond_signal(&rb->ring_avail_cond);
+    pthread_cond_signal(&rb->ring_free_cond);
+}
+
+void sys_ringbuffer_reset(sys_ringbuffer* rb) {
+    pthread_mutex_lock(&rb->ring_mutex);
+    sys_ringbuffer_reset_locked(rb);
+    pthread_mutex_unlock(&rb->ring_mutex);
+}
+
+int32_t sys_ringbuffer_walloc(sys_ringbuffer* rb, uint32_t len) {
+    pthread_mutex_lock(&rb->ring_mutex);
+    rb->wsize_req = static_cast<int32_t>(len);
+    int32_t free_space = sys_ringbuffer_free_internal(rb);
+    while (free_space < static_cast<int32_t>(len) && !load_eos(rb)) {
+        if (rb_cond_timed_wait(&rb->ring_free_cond, &rb->ring_mutex) != 0) {
+            rb->wsize_req = 0;
+            pthread_mutex_unlock(&rb->ring_mutex);
+            return -2;
+        }
+        if (rb->error) {
+            rb->error = 0;
+            if (load_cnt(rb) == 0 && rb->pread == rb->pwrite) {
+                rb->wsize_req = 0;
+                pthread_mutex_unlock(&rb->ring_mutex);
+                return -1;
+            }
+        }
+        free_space = sys_ringbuffer_free_internal(rb);
+    }
+    rb->wsize_req = 0;
+    pthread_mutex_unlock(&rb->ring_mutex);
+    return free_space;
+}
+
+void sys_ringbuffer_byte_release(sys_ringbuffer* rb, uint32_t len) {
+    pthread_mutex_lock(&rb->ring_mutex);
+    uint32_t p = rb->pread + len;
+    if (p >= rb->size) p -= rb->size;
+    rb->pread = p;
+    store_cnt(rb, load_cnt(rb) - len);
+    if (rb->wsize_req != 0 && sys_ringbuffer_free_internal(rb) >= rb->wsize_req)
+        pthread_cond_signal(&rb->ring_free_cond);
+    rb->srlock = 0;
+    pthread_mutex_unlock(&rb->ring_mutex);
+}
+
+int32_t sys_ringbuffer_read_peek(sys_ringbuffer* rb, uint8_t* dst, uint32_t len, uint32_t skip) {
+    uint32_t start = rb->pread + skip;
+    if (start >= rb->size) start -= rb->size;
+    if (start + len > rb->size) {
+        const uint32_t tail = rb->size - start;
+        memcpy(dst, rb->data + start, tail);
+        memcpy(dst + tail, rb->data, len - tail);
+    } else {
+        memcpy(dst, rb->data + start, len);
+    }
+    return static_cast<int32_t>(len);
+}
+
+int32_t sys_ringbuffer_byte_read_peek(sys_ringbuffer* rb, uint8_t* dst, int32_t len) {
+    pthread_mutex_lock(&rb->ring_mutex);
+    rb->rsize_req = len;
+    rb->srlock = 1;
+    int32_t avail = sys_ringbuffer_avail_internal(rb);
+    while (avail < len && !load_eos(rb)) {
+        if (rb_cond_timed_wait(&rb->ring_avail_cond, &rb->ring_mutex) != 0) break;
+        avail = sys_ringbuffer_avail_internal(rb);
+    }
+    uint32_t count = load_cnt(rb);
+    if (static_cast<uint32_t>(len) < count) count = static_cast<uint32_t>(len);
+    if (dst && count) sys_ringbuffer_read_peek(rb, dst, count, 0);
+    rb->rsize_req = 0;
+    pthread_mutex_unlock(&rb->ring_mutex);
+    return static_cast<int32_t>(count);
+}
+
+int32_t sys_ringbuffer_byte_read_peek_single_thread(sys_ringbuffer* rb, uint8_t* dst,
+                                                    int32_t len) {
+    uint32_t count = load_cnt(rb);
+    if (static_cast<uint32_t>(len) < count) count = static_cast<uint32_t>(len);
+    if (dst && count) sys_ringbuffer_read_peek(rb, dst, count, 0);
+    return static_cast<int32_t>(count);
+}
+
+int32_t sys_ringbuffer_byte_write(sys_ringbuffer* rb, const uint8_t* src, uint32_t len) {
+    pthread_mutex_lock(&rb->ring_mutex);
+    if (!rb->rlock) {
+        copy_in(rb, src, len);
+        store_cnt(rb, load_cnt(rb) + len);
+    }
+    // Stored or dropped, the producer's block is no longer in flight.
+    rb->rlock = 0;
+    rb->wlock = 0;
+    if (rb->rsize_req != 0) pthread_cond_signal(&rb->ring_avail_cond);
+    pthread_mutex_unlock(&rb->ring_mutex);
+    return static_cast<int32_t>(len);
+}
+
+int32_t sys_ringbuffer_byte_write2(sys_ringbuffer* rb, uint32_t len) {
+    pthread_mutex_lock(&rb->ring_mutex);
+    if (!rb->rlock) {
+        store_cnt(rb, load_cnt(rb) + len);
+        if (rb->pwrite + len > rb->size) {
+            const uint32_t over = rb->pwrite + len - rb->size;
+            memmove(rb->data, rb->data + rb->size, over);
+            rb->pwrite = over;
+        } else {
+            rb->pwrite += len;
+            if (rb->pwrite == rb->size) rb->pwrite = 0;
+        }
+    }
+    // Stored or dropped, the producer's block is no longer in flight.
+    rb->rlock = 0;
+    rb->wlock = 0;
+    if (rb->rsize_req != 0) pthread_cond_signal(&rb->ring_avail_cond);
+    pthread_mutex_unlock(&rb->ring_mutex);
+    return static_cast<int32_t>(len);
+}

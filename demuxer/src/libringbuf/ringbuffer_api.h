@@ -1,0 +1,69 @@
+/*
+ * Byte FIFO over storage its owner supplies, for one producer and one
+ * consumer, guarded by one mutex with two condition variables. Consumers
+ * read in two steps (read-peek, then release) so that a peek costs nothing
+ * extra. The marks rlock/wlock/slock/srlock let the reader and its streaming
+ * thread agree on which blocks survive a seek.
+ */
+#ifndef SYS_RINGBUFFER_API_H
+#define SYS_RINGBUFFER_API_H
+
+#include <pthread.h>
+#include <stdint.h>
+
+typedef pthread_mutex_t rb_mutex_t;
+typedef pthread_cond_t rb_cond_t;
+
+struct sys_ringbuffer {
+    uint8_t* data;           /* storage of `size` bytes, owned by the creator */
+    uint32_t size;
+    uint32_t pread;          /* next byte to consume */
+    uint32_t pwrite;         /* next byte to produce */
+    volatile uint32_t pkt_cnt; /* bytes produced and not yet released */
+    int16_t buf_eos;         /* no more data will come */
+    int32_t wsize_req;       /* bytes a producer waits to write */
+    int32_t rsize_req;       /* bytes a consumer waits to read */
+    int32_t error;           /* flush mark for a waiting producer */
+    int8_t rlock;            /* drop the next write */
+    int8_t wlock;            /* the producer holds a block not yet stored */
+    volatile int8_t slock;   /* readers pause while set */
+    int8_t srlock;           /* a consumer is between read-peek and release */
+    rb_mutex_t ring_mutex;
+    rb_cond_t ring_avail_cond;
+    rb_cond_t ring_free_cond;
+};
+typedef struct sys_ringbuffer sys_ringbuffer;
+
+/* Seconds a waiter sleeps without a wake-up before it gives up. */
+constexpr int SYS_RINGBUFFER_WAIT_S = 10;
+
+void sys_ringbuffer_init(sys_ringbuffer* rb, uint8_t* data, uint32_t len);
+void sys_ringbuffer_destroy(sys_ringbuffer* rb);
+void sys_ringbuffer_close(sys_ringbuffer* rb);
+int sys_ringbuffer_empty(sys_ringbuffer* rb);
+int32_t sys_ringbuffer_free(sys_ringbuffer* rb);
+int32_t sys_ringbuffer_avail(sys_ringbuffer* rb);
+void sys_ringbuffer_flush(sys_ringbuffer* rb);
+void sys_ringbuffer_reset(sys_ringbuffer* rb);
+/* Waits for room for `len` bytes; free space, -1 after a flush of an empty
+ * ring, -2 after the timed wait expired. */
+int32_t sys_ringbuffer_walloc(sys_ringbuffer* rb, uint32_t len);
+void sys_ringbuffer_byte_release(sys_ringbuffer* rb, uint32_t len);
+/* Copies `len` bytes starting `skip` bytes after pread; caller holds the lock or is alone. */
+int32_t sys_ringbuffer_read_peek(sys_ringbuffer* rb, uint8_t* dst, uint32_t len, uint32_t skip);
+/* Waits until `len` bytes are held (or end of stream, or the wait expires);
+ * copies up to `len` into dst unless it is null; pread does not move. */
+int32_t sys_ringbuffer_byte_read_peek(sys_ringbuffer* rb, uint8_t* dst, int32_t len);
+int32_t sys_ringbuffer_byte_read_peek_single_thread(sys_ringbuffer* rb, uint8_t* dst, int32_t len);
+int32_t sys_ringbuffer_byte_write(sys_ringbuffer* rb, const uint8_t* src, uint32_t len);
+int32_t sys_ringbuffer_byte_write2(sys_ringbuffer* rb, uint32_t len);
+
+/* Both writes clear rlock and wlock: the producer's block is then stored or
+ * dropped, no longer in flight. */
+
+/* Internal forms for callers that already hold ring_mutex. */
+void sys_ringbuffer_reset_locked(sys_ringbuffer* rb);
+int32_t sys_ringbuffer_free_internal(const sys_ringbuffer* rb);
+int32_t sys_ringbuffer_avail_internal(const sys_ringbuffer* rb);
+
+#endif /* SYS_RINGBUFFER_API_H */

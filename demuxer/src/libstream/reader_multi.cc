@@ -1,0 +1,120 @@
+// The multi-thread operation set: reads, peeks and seeks served from the ring
+// that the streaming thread fills.
+#include <unistd.h>
+
+#include "stream_internal.h"
+
+namespace {
+
+// Largest request the ring can ever satisfy at once.
+int32_t ring_capacity(const sys_ringbuffer* rb) { return static_cast<int32_t>(rb->size - 1); }
+
+CB_ErrCode short_outcome(const sys_ringbuffer* rb) {
+    return rb_eos(rb) ? CB_ERR_EOF : CB_ERR_TIMEDOUT;
+}
+
+bool ring_has_thread(const cb_buffer_st* cb) { return cb->thread_type == CB_MULTI_THREAD; }
+
+}  // namespace
+
+void init_multi_thread_plugin(cb_buffer_st* cb) {
+    cb->cb_read = cb_read_multi;
+    cb->cb_peek = cb_peek_multi;
+    cb->cb_seek = cb_seek_multi;
+    cb->cb_seek64 = cb_seek_multi64;
+}
+
+cb_off_t reposition_ring_input(cb_buffer_st* cb, cb_off_t target, int whence) {
+    sys_ringbuffer* rb = cb->active_rbuf;
+    cb_io_st* in = cb->input;
+    // One critical section for the input move and the emptying of the ring:
+    // the thread reads the input only under this lock, so every block it
+    // reads is either wholly before this point or wholly after it. A block
+    // read before and not yet stored (wlock) is dropped by the ring when the
+    // thread stores it (rlock).
+    pthread_mutex_lock(&rb->ring_mutex);
+    const cb_off_t r = in->seek(in, target, whence);
+    if (r != -1) {
+        if (rb->wlock) rb->rlock = 1;
+        sys_ringbuffer_reset_locked(rb);
+    }
+    pthread_mutex_unlock(&rb->ring_mutex);
+    return r;
+}
+
+int32_t cb_read_multi(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
+    sys_ringbuffer* rb = cb->active_rbuf;
+    if (!rb) return cb_read_single(cb, dst, size);
+    if (size <= 0) return 0;
+    // Requests beyond the ring's capacity are served in pieces that fit.
+    const int32_t cap = ring_capacity(rb);
+    int32_t total = 0;
+    cb->cb_errcode = CB_ERR_OK;
+    while (total < size) {
+        int32_t want = size - total;
+        if (want > cap) want = cap;
+        const int32_t n = sys_ringbuffer_byte_read_peek(rb, dst ? dst + total : nullptr, want);
+        if (n > 0) sys_ringbuffer_byte_release(rb, static_cast<uint32_t>(n));
+        total += n;
+        if (n < want) {
+            cb->cb_errcode = short_outcome(rb);
+            break;
+        }
+    }
+    cb->curpos += static_cast<cb_fpos>(total);
+    wait_while_paused(rb);
+    return total;
+}
+
+int32_t cb_peek_multi(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
+    sys_ringbuffer* rb = cb->active_rbuf;
+    if (!rb) return cb_peek_single(cb, dst, size);
+    if (size <= 0) return 0;
+    // A peek can show at most what the ring can hold.
+    if (size > ring_capacity(rb)) size = ring_capacity(rb);
+    const int32_t n = sys_ringbuffer_byte_read_peek(rb, dst, size);
+    cb->cb_errcode = n < size ? short_outcome(rb) : CB_ERR_OK;
+    pthread_mutex_lock(&rb->ring_mutex);
+    rb->srlock = 0;
+    pthread_mutex_unlock(&rb->ring_mutex);
+    wait_while_paused(rb);
+    return n;
+}
+
+cb_off_t cb_seek_multi64(cb_buffer_st* cb, cb_off_t offset, int whence) {
+    sys_ringbuffer* rb = cb->active_rbuf;
+    if (!rb) return cb_seek_single64(cb, offset, whence);
+    if (whence != CB_SEEK_SET && whence != CB_SEEK_CUR && whence != CB_SEEK_END) return -1;
+    if (whence == CB_SEEK_END) return static_cast<cb_off_t>(cb->curpos);
+
+    // Nothing fills a ring without a thread; a target beyond what it holds
+    // is waited for only as long as the ring waits for data, then the input
+    // is moved as for any target outside the buffer.
+    if (!ring_has_thread(cb) && cb->input->rbuf_mode == CBIO_APPLY_RBUF) {
+        const time_t give_up = time(nullptr) + SYS_RINGBUFFER_WAIT_S;
+        while (seek_out_of_buffer(cb, offset, whence)) {
+            if (rb_eos(rb)) return -1;
+            if (time(nullptr) >= give_up) break;
+            usleep(1000);
+        }
+    }
+
+    const cb_off_t cur = static_cast<cb_off_t>(cb->curpos);
+    const cb_off_t held = rb_held(rb);
+    const cb_off_t target = whence == CB_SEEK_SET ? offset : cur + offset;
+    if (target >= cur && target - cur <= held) {
+        if (target > cur) (void)cb->cb_read(cb, nullptr, static_cast<int32_t>(target - cur));
+        return static_cast<cb_off_t>(cb->curpos);
+    }
+    if (target < 0) return -1;
+    // A refused move changes nothing: the ring still holds the bytes at curpos.
+    const cb_off_t r = reposition_ring_input(cb, target, CB_SEEK_SET);
+    if (r == -1) return -1;
+    cb->curpos = static_cast<cb_fpos>(r);
+    return r;
+}
+
+int32_t cb_seek_multi(cb_buffer_st* cb, int32_t offset, int whence) {
+    return static_cast<int32_t>(
+        static_cast<uint32_t>(cb_seek_multi64(cb, static_cast<cb_off_t>(offset), whence)));
+}

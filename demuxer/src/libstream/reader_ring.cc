@@ -1,0 +1,72 @@
+// The synchronous ring of the single-thread set: the reader tops the ring up
+// from the input itself, in block_size pieces, when it needs more bytes than
+// the ring holds. Must not run while a streaming thread fills the same ring.
+#include <unistd.h>
+
+#include "stream_internal.h"
+
+void wait_while_paused(sys_ringbuffer* rb) {
+    while (rb_paused(rb)) usleep(1000);
+}
+
+void WriteData(cb_buffer_st* cb, uint32_t wanted) {
+    sys_ringbuffer* rb = cb->active_rbuf;
+    if (rb_held(rb) >= wanted || rb_eos(rb)) return;
+    for (;;) {
+        const int block = cb->input->block_size;
+        if (sys_ringbuffer_free(rb) < block) return;
+        const size_t n = cb->input->read(cb->input, cb->base, static_cast<size_t>(block));
+        if (n == 0) {
+            rb_set_eos(rb, 1);
+            return;
+        }
+        sys_ringbuffer_byte_write(rb, cb->base, static_cast<uint32_t>(n));
+        if (rb_held(rb) >= wanted || rb_eos(rb)) return;
+    }
+}
+
+int32_t read_rbuf_data(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
+    sys_ringbuffer* rb = cb->active_rbuf;
+    if (size <= 0) return 0;
+    int32_t total = 0;
+    while (total < size) {
+        rb->srlock = 1;
+        const int32_t remain = size - total;
+        int32_t want = sys_ringbuffer_avail(rb);
+        if (want > remain) want = remain;
+        const int32_t count1 =
+            sys_ringbuffer_byte_read_peek_single_thread(rb, dst ? dst + total : nullptr, want);
+        sys_ringbuffer_byte_release(rb, static_cast<uint32_t>(count1));
+        int32_t count2 = 0;
+        const int32_t missing = remain - count1;
+        if (missing > 0) {
+            WriteData(cb, static_cast<uint32_t>(missing));
+            count2 = sys_ringbuffer_byte_read_peek_single_thread(
+                rb, dst ? dst + total + count1 : nullptr, missing);
+            sys_ringbuffer_byte_release(rb, static_cast<uint32_t>(count2));
+        }
+        const int32_t pass = count1 + count2;
+        cb->curpos += static_cast<cb_fpos>(pass);
+        total += pass;
+        rb->srlock = 0;
+        wait_while_paused(rb);
+        if (total < size && rb_eos(rb)) {
+            cb->cb_errcode = CB_ERR_EOF;
+            return total;
+        }
+        cb->cb_errcode = CB_ERR_OK;
+    }
+    return total;
+}
+
+int32_t peek_rbuf_data(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
+    sys_ringbuffer* rb = cb->active_rbuf;
+    if (size <= 0) return 0;
+    rb->srlock = 1;
+    WriteData(cb, static_cast<uint32_t>(size));
+    const int32_t count = sys_ringbuffer_byte_read_peek_single_thread(rb, dst, size);
+    cb->cb_errcode = count < size ? CB_ERR_EOF : CB_ERR_OK;
+    rb->srlock = 0;
+    wait_while_paused(rb);
+    return count;
+}

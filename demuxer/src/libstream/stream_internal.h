@@ -1,0 +1,62 @@
+// Pieces shared by the reader's files; not for the parsers.
+#pragma once
+
+#include <stddef.h>
+#include <stdint.h>
+
+#include "ringbuffer_api.h"
+#include "streaming.h"
+
+// `state` is written by open/close on the demuxer thread and polled by the
+// streaming thread.
+inline int cb_state_load(const cb_buffer_st* cb) {
+    return __atomic_load_n(&cb->state, __ATOMIC_ACQUIRE);
+}
+inline void cb_state_store(cb_buffer_st* cb, int v) {
+    __atomic_store_n(&cb->state, v, __ATOMIC_RELEASE);
+}
+inline uint32_t rb_held(const sys_ringbuffer* rb) {
+    return __atomic_load_n(&rb->pkt_cnt, __ATOMIC_ACQUIRE);
+}
+inline bool rb_eos(const sys_ringbuffer* rb) {
+    return __atomic_load_n(&rb->buf_eos, __ATOMIC_ACQUIRE) != 0;
+}
+inline void rb_set_eos(sys_ringbuffer* rb, int16_t v) {
+    __atomic_store_n(&rb->buf_eos, v, __ATOMIC_RELEASE);
+}
+inline bool rb_paused(const sys_ringbuffer* rb) {
+    return __atomic_load_n(&rb->slock, __ATOMIC_ACQUIRE) != 0;
+}
+
+// Operation-set installers.
+void init_single_thread_plugin(cb_buffer_st* cb);
+void init_multi_thread_plugin(cb_buffer_st* cb);
+void init_es_plugin(cb_buffer_st* cb);
+void init_thread_plugin(cb_buffer_st* cb, int rbuf_mode);
+
+// File cache.
+void reset_fs_cache(fs_cache_st* c);
+void init_fs_cache(fs_cache_st* c, uint8_t* block, uint32_t len);
+size_t read_fs_cache(cb_buffer_st* cb, fs_cache_st* c, uint8_t* dst, size_t size, cb_fpos pos);
+int32_t peek_fs_cache(cb_buffer_st* cb, uint8_t* dst, int32_t size);
+
+// Synchronous ring.
+void WriteData(cb_buffer_st* cb, uint32_t wanted);
+int32_t read_rbuf_data(cb_buffer_st* cb, uint8_t* dst, int32_t size);
+int32_t peek_rbuf_data(cb_buffer_st* cb, uint8_t* dst, int32_t size);
+
+// Seeking helpers of the single-thread set.
+int seek_out_of_buffer(cb_buffer_st* cb, cb_off_t offset, int whence);
+void seek_reset_buffer(cb_buffer_st* cb, cb_off_t pos);
+
+// Sleeps in 1 ms steps while the ring's pause mark is set.
+void wait_while_paused(sys_ringbuffer* rb);
+
+// Moves the input to `target` (CB_SEEK_SET) and empties the ring so that it
+// holds nothing read before the move and receives every block read after it,
+// whether or not a streaming thread runs. Returns the input's answer.
+cb_off_t reposition_ring_input(cb_buffer_st* cb, cb_off_t target, int whence);
+
+// Starts / stops the streaming thread.
+int OpenStream(cb_buffer_st* cb, const hova_callback_st* cbs);
+void CloseStream(cb_buffer_st* cb, const hova_callback_st* cbs);

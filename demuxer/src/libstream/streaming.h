@@ -1,0 +1,65 @@
+/*
+ * The buffered reader between the parsers and the host's raw input.
+ *
+ * Open picks one of three operation sets from the input's `rbuf_mode`
+ * (single-thread, multi-thread with a streaming thread filling a ring,
+ * elementary-stream) and one of three bufferings (none, file cache, ring).
+ * Parsers always call through the record's slots:
+ *     cb->cb_read(cb, dst, n); cb->cb_peek(cb, dst, n);
+ *     cb->cb_seek(cb, off, whence); cb->cb_seek64(cb, off, whence);
+ * and ask the position with cb_tell64() / cb_tell().
+ */
+#ifndef PLIMO_STREAMING_H
+#define PLIMO_STREAMING_H
+
+#include <stdint.h>
+
+#include "cb_buffer.h"
+#include "cb_io.h"
+#include "es_cbio.h"
+#include "hova_dmx.h"
+
+/* Bytes reserved beside the streaming thread while it runs. */
+constexpr int CB_STREAM_THREAD_STACK = 6144;
+
+/* 0 on success, -1 on failure (nothing is then held). `cb` is read only. */
+int OpenURL(cb_buffer_st* cbuf, cb_io_st* input, int ringbuf_size, const hova_callback_st* cb);
+/* Stops and joins the streaming thread, releases every block. Always 0. */
+int CloseURL(cb_buffer_st* cbuf, const hova_callback_st* cb);
+
+cb_fpos cb_tell64(const cb_buffer_st* cbuf);
+int cb_tell(const cb_buffer_st* cbuf);      /* curpos truncated to 32 bits */
+int cb_status(const cb_buffer_st* cbuf);    /* CB_ErrCode of the last read or peek */
+/* Size of the input; leaves the reader at position 0 unless the input is streaming. */
+cb_fpos cb_get_file_size(cb_buffer_st* cbuf);
+/* Non-zero installs the multi-thread set, zero the single-thread set. */
+void changeThreadType(cb_buffer_st* cbuf, int useRingBuf);
+
+/* Empties the buffer and adopts the input's position (after the host moved it). */
+void cb_reset_cache(cb_buffer_st* cbuf);
+/* Asks the host to drop its own data (seek_time(-1)), then cb_reset_cache. */
+void cb_flush_data(cb_buffer_st* cbuf);
+void cb_flush_es_data(cb_buffer_st* cbuf, es_data_type_et type);
+/* 0 turns buffering off, non-zero back on; -1 when the input refuses the seek. */
+int cb_set_buffer_mode(cb_buffer_st* cbuf, int enable);
+
+/* The operation sets; installed in the slots by open and changeThreadType. */
+int32_t cb_read_single(cb_buffer_st* cbuf, uint8_t* dst, int32_t size);
+int32_t cb_peek_single(cb_buffer_st* cbuf, uint8_t* dst, int32_t size);
+int32_t cb_seek_single(cb_buffer_st* cbuf, int32_t offset, int whence);
+cb_off_t cb_seek_single64(cb_buffer_st* cbuf, cb_off_t offset, int whence);
+
+int32_t cb_read_multi(cb_buffer_st* cbuf, uint8_t* dst, int32_t size);
+int32_t cb_peek_multi(cb_buffer_st* cbuf, uint8_t* dst, int32_t size);
+int32_t cb_seek_multi(cb_buffer_st* cbuf, int32_t offset, int whence);
+cb_off_t cb_seek_multi64(cb_buffer_st* cbuf, cb_off_t offset, int whence);
+
+int32_t cb_read_es_mode(cb_buffer_st* cbuf, uint8_t* dst, int32_t size);
+int32_t cb_peek_es_mode(cb_buffer_st* cbuf, uint8_t* dst, int32_t size);
+int32_t cb_seek_es_mode(cb_buffer_st* cbuf, int32_t offset, int whence);
+cb_off_t cb_seek_es_mode64(cb_buffer_st* cbuf, cb_off_t offset, int whence);
+
+/* The streaming thread's body; its argument is the reader. */
+void* StreamingData(void* arg);
+
+#endif /* PLIMO_STREAMING_H */
