@@ -1,0 +1,28 @@
+// A common demuxer state wired to the reference host's callbacks. Every test
+// built on it ends by checking that the host holds no block of the toolkit.
+#pragma once
+
+#include <gtest/gtest.h>
+
+#include <cstring>
+
+#include "callbacks.h"
+#include "sys_demuxer.h"
+#include "sys_output.h"
+
+class HostedToolkit : public ::testing::Test {
+protected:
+    HostedToolkit() {
+        std::memset(&d, 0, sizeof d);
+        d.callback = *host.table();
+    }
+    void TearDown() override {
+        EXPECT_EQ(host.outstanding_blocks(), 0u) << "the host still holds toolkit blocks";
+        EXPECT_EQ(host.foreign_frees(), 0u);
+    }
+    template <typename T>
+    void release(T*& p) { sys_free(&d, p); }
+
+    host::HostCallbacks host;
+    sys_demuxer_st d;
+};
