@@ -1,6 +1,7 @@
 #include "sys_pts.h"
 
 #include "dprintf.h"
+#include "streaming.h"
 
 namespace {
 
@@ -78,8 +79,7 @@ void sys_set_drop_target(hova_stream_type_et target_type, sys_stream_st* s, cb_f
 
 int sys_check_drop(sys_demuxer_st* d, sys_stream_st* s) {
     if (s->next_pos == kNoTarget) return 0;
-    // The reader's logical position (what cb_tell64 answers).
-    if (d->cbuffer.curpos < s->next_pos) return 1;
+    if (cb_tell64(&d->cbuffer) < s->next_pos) return 1;
     s->next_pos = kNoTarget;
     return 0;
 }
