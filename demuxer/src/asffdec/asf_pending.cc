@@ -4,14 +4,6 @@
 
 extern "C" {
 
-int asf_init_demuxer(void** ctx, cb_io_st*, void*, int, int, const hova_callback_st*) {
-    if (ctx) *ctx = nullptr;
-    ASF_LOG("open is not available in this build\n");
-    return HOVA_OpenFailed;
-}
-
-int asf_close_demuxer(void*) { return HOVA_InvalidParam; }
-int asf_get_information(void*, hova_stream_type_et, int, void*) { return HOVA_InvalidParam; }
 int asf_deliver_frame(void*, hova_stream_type_et*, int*, int64_t*) { return HOVA_InvalidParam; }
 int asf_seek_time(void*, int, int64_t*, int) { return HOVA_InvalidParam; }
 int asf_resync_time(void*, int64_t) { return HOVA_InvalidParam; }

@@ -1,0 +1,175 @@
+// Opening a file (context, reader, header, data object, simple index) and
+// closing it (every block back to the host, reader closed).
+#include <cstring>
+
+#include "asf_api.h"
+#include "asf_guid.h"
+#include "asf_internal.h"
+#include "asf_io.h"
+#include "asf_objects.h"
+#include "byte_reader.h"
+#include "dprintf.h"
+#include "streaming.h"
+#include "sys_output.h"
+
+using plimo::load_le;
+
+namespace {
+
+constexpr uintptr_t kAlign = 8;
+// The fixed record plus the worst-case alignment step.
+constexpr unsigned kMinBufsize = sizeof(asf_demuxer_st) + kAlign;
+
+cb_off_t id3v2_tag_length(const uint8_t* h) {
+    return static_cast<cb_off_t>(((h[6] & 0x7F) << 21) | ((h[7] & 0x7F) << 14) |
+                                 ((h[8] & 0x7F) << 7) | (h[9] & 0x7F)) +
+           10;
+}
+
+int fail_open(asf_demuxer_st* d, int rc) {
+    asf_free_memory(d);
+    CloseURL(&d->s.cbuffer, &d->s.callback);
+    return rc;
+}
+
+}  // namespace
+
+int asf_stream_capacity(const void* buffer, int bufsize, const asf_demuxer_st* ctx) {
+    // A negative size passes the unsigned size check; nothing is known about
+    // the buffer then but the descriptor's promise of two records.
+    if (bufsize < 0) return 2;
+    const auto start = reinterpret_cast<uintptr_t>(buffer);
+    const auto records = reinterpret_cast<uintptr_t>(ctx->stream_info);
+    const uintptr_t end = start + static_cast<unsigned>(bufsize);
+    if (records >= end) return 0;
+    const uintptr_t n = (end - records) / sizeof(asf_stream_st);
+    return n > 127 ? 127 : static_cast<int>(n);
+}
+
+void reset_data_packet(asf_packet_st* packet, uint64_t packet_num) {
+    std::memset(packet, 0, sizeof *packet);
+    packet->num = packet_num;
+}
+
+void reset_last_thumbnail_pts(asf_demuxer_st* d) {
+    for (int k = AUD; k <= VID; ++k)
+        if (d->s.active_stream[k] >= 0) d->stream_info[d->s.active_stream[k]].s.last_thumbnail_pts = -1;
+}
+
+void reset_stream_pts(asf_demuxer_st* d) {
+    for (int k = AUD; k <= VID; ++k)
+        if (d->s.active_stream[k] >= 0) d->stream_info[d->s.active_stream[k]].pts = -1;
+}
+
+void asf_free_memory(asf_demuxer_st* d) {
+    sys_demuxer_st* s = &d->s;
+    for (int i = 0; i < s->total_streams; ++i) sys_free(s, d->stream_info[i].s.config);
+    sys_free(s, d->cover.payload);
+    sys_free(s, d->title.payload);
+    sys_free(s, d->author.payload);
+    sys_free(s, d->albumTitle.payload);
+    sys_free(s, d->genre);
+}
+
+void asf_parse_index(asf_demuxer_st* d) {
+    namespace si = asf::simple_index;
+    cb_buffer_st* cb = &d->s.cbuffer;
+    d->index_packet = 0;
+    for (;;) {
+        uint8_t h[si::kSize];
+        if (cb->cb_peek(cb, h, static_cast<int32_t>(asf::kObjectHeaderSize)) <
+            static_cast<int32_t>(asf::kObjectHeaderSize))
+            break;
+        const guid_st g = guid_from_bytes(h);
+        if (sys_is_equal_guid(&g, &asf_simple_index_object)) {
+            if (!asf::read_exact(d, h, si::kSize)) return;
+            d->index_count = load_le<uint32_t>(h + si::kIndexCount);
+            d->index_packet = cb_tell64(cb);
+            d->index_time_interval = load_le<uint64_t>(h + si::kTimeInterval) / 10;
+            break;  // only the first simple index is used
+        }
+        const auto size = static_cast<cb_off_t>(load_le<uint64_t>(h + asf::kObjSize));
+        if (size < 1) return;
+        if (cb->cb_seek64(cb, size, CB_SEEK_CUR) == -1) return;
+    }
+    if (d->index_packet != 0) d->index_start_offset = -1;
+}
+
+int asf_judge_streaming_seekable(asf_demuxer_st* d) {
+    return (d->index_count > 1 && d->index_packet != 0 && d->index_time_interval != 0) ? 1 : 0;
+}
+
+extern "C" int asf_init_demuxer(void** ctx, cb_io_st* cbio, void* buffer, int bufsize,
+                                int ringbuf_size, const hova_callback_st* cb) {
+    DPRINTF("[demuxer_format]: ASF\n");
+    if (static_cast<unsigned>(bufsize) < kMinBufsize) return HOVA_NotEnoughMemory;
+    if (!ctx || !cbio || !buffer || !cb) return HOVA_InvalidParam;
+
+    const uintptr_t at = (reinterpret_cast<uintptr_t>(buffer) + kAlign - 1) & ~(kAlign - 1);
+    auto* d = reinterpret_cast<asf_demuxer_st*>(at);
+    *ctx = d;
+    std::memset(d, 0, sizeof *d);
+    d->s.callback = *cb;
+    cb_buffer_st* rd = &d->s.cbuffer;
+    if (OpenURL(rd, cbio, ringbuf_size, cb) != 0) return HOVA_NotEnoughMemory;
+
+    d->s.seekable = cbio->seekable;
+    d->s.streaming = cbio->streaming;
+    // Every record the host's buffer holds is used, two at the least size.
+    d->max_streams = asf_stream_capacity(buffer, bufsize, d);
+    d->s.active_stream[AUD] = d->s.active_stream[VID] = d->s.active_stream[SUB] = -1;
+    d->parse_mode = PARSE_SEQ;
+    d->parse_file_end = 0;
+    reset_data_packet(&d->cur_data_packet, 0);
+
+    uint8_t id3[10];
+    if (rd->cb_peek(rd, id3, sizeof id3) == static_cast<int32_t>(sizeof id3) &&
+        std::memcmp(id3, "ID3", 3) == 0)
+        (void)rd->cb_seek64(rd, id3v2_tag_length(id3), CB_SEEK_SET);
+
+    const int rc = asf_parse_header(d);
+    if (rc != HOVA_OK) return fail_open(d, rc);
+
+    uint8_t data_obj[asf::data_object::kSize];
+    if (!asf::read_exact(d, data_obj, sizeof data_obj)) return fail_open(d, HOVA_OpenFailed);
+
+    d->seeked = 1;
+    d->resync = 0;
+    d->cur_packets = 0;
+    d->first_packet = static_cast<uint32_t>(cb_tell64(rd));
+    d->index_packet = 0;
+    d->accept_stream_type = HOVA_STREAM_NONE;
+    d->index_count = 0;
+    d->s.thumbnail_interval = -1;
+    reset_last_thumbnail_pts(d);
+    reset_stream_pts(d);
+    // Audio-only files need no index: the reader already stands at packet 0.
+    if (d->s.active_stream[VID] < 0) return HOVA_OK;
+    if (!d->s.seekable) return HOVA_OK;
+
+    if (cbio->open_done)
+        (void)cbio->open_done(cbio, asf_get_bitrate(d, HOVA_STREAM_AUDIO),
+                              asf_get_bitrate(d, HOVA_STREAM_VIDEO),
+                              static_cast<uint32_t>(d->s.duration / 1000));
+
+    // Step over the packets to what follows the data object. A size below
+    // its own header would be a backward seek: the index is then unreachable.
+    const uint64_t data_size = load_le<uint64_t>(data_obj + asf::kObjSize);
+    if (data_size >= asf::data_object::kSize &&
+        data_size - asf::data_object::kSize <= static_cast<uint64_t>(INT64_MAX) &&
+        rd->cb_seek64(rd, static_cast<cb_off_t>(data_size - asf::data_object::kSize),
+                      CB_SEEK_CUR) != -1)
+        asf_parse_index(d);
+
+    if (d->s.streaming) d->s.seekable = asf_judge_streaming_seekable(d);
+    (void)rd->cb_seek64(rd, d->first_packet, CB_SEEK_SET);
+    return HOVA_OK;
+}
+
+extern "C" int asf_close_demuxer(void* ctx) {
+    if (!ctx) return HOVA_InvalidParam;
+    auto* d = static_cast<asf_demuxer_st*>(ctx);
+    asf_free_memory(d);
+    CloseURL(&d->s.cbuffer, &d->s.callback);
+    return HOVA_OK;
+}
