@@ -97,8 +97,16 @@ size_t RawInput::read_at(uint64_t pos, void* dst, size_t len) {
     return len;
 }
 
+size_t RawInput::peek(void* dst, size_t len) {
+    const uint64_t end = end_now();
+    if (pos_ >= end) return 0;
+    const size_t n = static_cast<size_t>(std::min<uint64_t>(len, end - pos_));
+    return read_at(pos_, dst, n);
+}
+
 size_t RawInput::op_read(cb_io_st* io, void* dst, size_t len) {
     RawInput* in = of(io);
+    if (in->faults_.before_read) in->faults_.before_read(in->pos_, len);
     in->counters_.reads++;
     if (in->faults_.read_delay_us) ::usleep(in->faults_.read_delay_us);
     if (in->faults_.visible_start != UINT64_MAX && in->visible_ == UINT64_MAX)

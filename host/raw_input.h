@@ -5,6 +5,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <string>
 #include <vector>
@@ -21,6 +22,7 @@ struct InputOptions {
     uint8_t rbuf_mode = CBIO_NO_RBUF;
     bool disable_cache = false;
     int detect_discontinuity = 0;
+    int ring_size = 1048576;       // what the host passes to open_file
 };
 
 struct InputFaults {
@@ -34,6 +36,9 @@ struct InputFaults {
     // read call makes `grow_per_read` more visible. 0 disables growth.
     uint64_t visible_start = UINT64_MAX;
     uint64_t grow_per_read = 0;
+    // Called at the start of every read with the position and the length
+    // asked; may block (a stalling input) or yield to shuffle thread timing.
+    std::function<void(uint64_t pos, size_t len)> before_read;
 };
 
 struct InputCounters {
@@ -68,6 +73,9 @@ public:
     InputFaults& faults() { return faults_; }
     InputCounters& counters() { return counters_; }
     void apply(const InputOptions& opts);
+    // Up to `len` bytes at the current position, which does not move
+    // (respects the faults that end the input early).
+    size_t peek(void* dst, size_t len);
 
     // Host-side answers for the optional operations.
     int seek_time_result = 0;
