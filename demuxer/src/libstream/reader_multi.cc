@@ -6,8 +6,13 @@
 
 namespace {
 
-// Largest request the ring can ever satisfy at once.
-int32_t ring_capacity(const sys_ringbuffer* rb) { return static_cast<int32_t>(rb->size - 1); }
+// Largest request the ring is sure to satisfy at once: the thread stores
+// only whole blocks, so it stops topping up when less than a block is free.
+int32_t ring_capacity(const cb_buffer_st* cb) {
+    const int32_t cap = static_cast<int32_t>(cb->active_rbuf->size - 1);
+    const int32_t block = cb->input->block_size;
+    return (block > 0 && block <= cap) ? cap - block + 1 : cap;
+}
 
 CB_ErrCode short_outcome(const sys_ringbuffer* rb) {
     return rb_eos(rb) ? CB_ERR_EOF : CB_ERR_TIMEDOUT;
@@ -47,7 +52,7 @@ int32_t cb_read_multi(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
     if (!rb) return cb_read_single(cb, dst, size);
     if (size <= 0) return 0;
     // Requests beyond the ring's capacity are served in pieces that fit.
-    const int32_t cap = ring_capacity(rb);
+    const int32_t cap = ring_capacity(cb);
     int32_t total = 0;
     cb->cb_errcode = CB_ERR_OK;
     while (total < size) {
@@ -71,7 +76,7 @@ int32_t cb_peek_multi(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
     if (!rb) return cb_peek_single(cb, dst, size);
     if (size <= 0) return 0;
     // A peek can show at most what the ring can hold.
-    if (size > ring_capacity(rb)) size = ring_capacity(rb);
+    if (size > ring_capacity(cb)) size = ring_capacity(cb);
     const int32_t n = sys_ringbuffer_byte_read_peek(rb, dst, size);
     cb->cb_errcode = n < size ? short_outcome(rb) : CB_ERR_OK;
     pthread_mutex_lock(&rb->ring_mutex);
