@@ -1,0 +1,521 @@
+#include <gtest/gtest.h>
+
+#include <climits>
+#include <cstring>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "raw_input.h"
+#include "streaming.h"
+#include "sys_id3.h"
+#include "test_env.h"
+#include "toolkit_builders.h"
+#include "toolkit_fixture.h"
+
+namespace {
+
+using tkb::Bytes;
+using tkb::Id3Frame;
+using tkb::text;
+using tkb::text_frame;
+
+std::string str(const hova_string_info_st& s) {
+    return s.payload ? std::string(reinterpret_cast<const char*>(s.payload), s.size) : std::string();
+}
+
+class Id3 : public HostedToolkit {
+protected:
+    // Opens the reader over `file`; the input reports its size as known.
+    void open(const Bytes& file, const host::InputOptions& opts = {}) {
+        input = host::RawInput::from_memory(file, opts);
+        ASSERT_EQ(OpenURL(&reader, input->io(), opts.ring_size, host.table()), 0);
+        opened = true;
+        std::memset(&ctx, 0, sizeof ctx);
+        ctx.file_size = file.size();
+    }
+    int parse() { return parse_ID3(&reader, host.table(), &ctx); }
+    void close() {
+        release(ctx.id3_info_buffer);
+        if (opened) CloseURL(&reader, host.table());
+        opened = false;
+    }
+    void TearDown() override {
+        close();
+        HostedToolkit::TearDown();
+    }
+    const ST_ID3_INFO& info() const { return ctx.id3_info; }
+
+    std::unique_ptr<host::RawInput> input;
+    cb_buffer_st reader{};
+    id3_context_st ctx{};
+    bool opened = false;
+};
+
+const Bytes kAudio = tkb::pattern(400, 3);
+
+TEST_F(Id3, DecodesTheTextFramesOfEveryVersion) {
+    struct Item {
+        const char* id3;
+        const char* id2;
+        hova_string_info_st ST_ID3_INFO::*item;
+        uint32_t flag;
+    };
+    const Item items[] = {
+        {"TIT2", "TT2", &ST_ID3_INFO::Title, ID3_TITLE},
+        {"TPE1", "TP1", &ST_ID3_INFO::Artist, ID3_ARTIST},
+        {"TALB", "TAL", &ST_ID3_INFO::Album, ID3_ALBUM},
+        {"TYER", "TYE", &ST_ID3_INFO::Year, ID3_YEAR},
+        {"COMM", "COM", &ST_ID3_INFO::Comment, ID3_COMMENT},
+        {"TCON", "TCO", &ST_ID3_INFO::Genre, ID3_GENRE},
+        {"TCMP", "TCP", &ST_ID3_INFO::Compilation, ID3_COMPILATION},
+        {"TCOM", "TCM", &ST_ID3_INFO::Composer, ID3_COMPOSER},
+        {"TPE2", "TP2", &ST_ID3_INFO::AlbumArtist, ID3_ALBUMARTIST},
+        {"TPOS", "TPA", &ST_ID3_INFO::DiscNumber, ID3_DISCNUMBER},
+        {"TRCK", "TRK", &ST_ID3_INFO::CDTrackNumber, ID3_CDTRACKNUMBER},
+        {"TIT1", "TT1", &ST_ID3_INFO::Grouping, ID3_GROUPING},
+        {"TEXT", "TXT", &ST_ID3_INFO::Lyricist, ID3_LYRICIST},
+    };
+    for (int version : {2, 3, 4}) {
+        SCOPED_TRACE(testing::Message() << "version " << version);
+        std::vector<Id3Frame> frames;
+        for (size_t i = 0; i < std::size(items); ++i) {
+            const std::string value = std::string("value ") + items[i].id3;
+            frames.push_back(text_frame(version == 2 ? items[i].id2 : items[i].id3,
+                                        static_cast<uint8_t>(i % 4), text(value)));
+        }
+        open(tkb::cat({tkb::id3_tag(version, tkb::id3_frames(version, frames), 20), kAudio}));
+        ASSERT_EQ(parse(), 1);
+        uint32_t all = 0;
+        for (size_t i = 0; i < std::size(items); ++i) {
+            const hova_string_info_st& s = info().*(items[i].item);
+            EXPECT_EQ(str(s), std::string("value ") + items[i].id3);
+            EXPECT_EQ(s.payload[s.size], 0) << "text ends with a NUL";
+            const hova_string_format_et formats[] = {HOVA_STRING_FORMAT_ASCII, HOVA_STRING_FORMAT_UCS2,
+                                                     HOVA_STRING_FORMAT_UTF16BE, HOVA_STRING_FORMAT_UTF8};
+            EXPECT_EQ(s.stringformat, formats[i % 4]);
+            all |= items[i].flag;
+        }
+        EXPECT_EQ(info().eID3TagFlags, all);
+        EXPECT_EQ(cb_tell64(&reader), static_cast<cb_fpos>(ctx.id3_v2_size)) << "reader stands after the tag";
+        close();
+    }
+}
+
+TEST_F(Id3, YearFromTdrcAndLaterFramesReplaceEarlierOnes) {
+    const std::vector<Id3Frame> frames = {text_frame("TIT2", 0, text("first")),
+                                          text_frame("TDRC", 0, text("2004-05")),
+                                          text_frame("TIT2", 3, text("second"))};
+    open(tkb::cat({tkb::id3_tag(4, tkb::id3_frames(4, frames)), kAudio}));
+    ASSERT_EQ(parse(), 1);
+    EXPECT_EQ(str(info().Title), "second");
+    EXPECT_EQ(info().Title.stringformat, HOVA_STRING_FORMAT_UTF8);
+    hova_program_info_st program{};
+    get_id3_info(&program, &info());
+    EXPECT_EQ(program.year, 2004);
+    EXPECT_EQ(str(program.title), "second");
+}
+
+TEST_F(Id3, TrackNumberTextGivesItsLeadingNumber) {
+    open(tkb::cat({tkb::id3_tag(3, tkb::id3_frames(3, {text_frame("TRCK", 0, text("7/10"))})), kAudio}));
+    ASSERT_EQ(parse(), 1);
+    EXPECT_EQ(info().CDTrackNumber.size, 4u);
+    EXPECT_EQ(info().CDTrackNumber.stringformat, HOVA_STRING_FORMAT_ASCII);
+    hova_program_info_st program{};
+    get_id3_info(&program, &info());
+    EXPECT_EQ(program.track_number, 7);
+}
+
+TEST(Id3Find, SearchesTheFirst257Positions) {
+    struct Case {
+        size_t at;
+        int found;
+    };
+    for (const Case c : {Case{0, 1}, Case{1, 1}, Case{256, 1}, Case{257, 0}}) {
+        Bytes probe(266, 0);
+        const Bytes tag = tkb::id3_tag(3, Bytes(100, 0));
+        std::copy(tag.begin(), tag.begin() + static_cast<long>(std::min<size_t>(10, 266 - c.at)),
+                  probe.begin() + static_cast<long>(c.at));
+        int pos = -1, size = -1;
+        EXPECT_EQ(find_ID3v2(probe.data(), 266, &pos, &size), c.found) << c.at;
+        if (c.found) {
+            EXPECT_EQ(pos, static_cast<int>(c.at));
+            EXPECT_EQ(size, 110);
+        }
+    }
+    testenv::LogCapture log;
+    int pos = 0, size = 0;
+    EXPECT_EQ(find_ID3v2(reinterpret_cast<const uint8_t*>("ID3\3\0\0\0\0\0"), 9, &pos, &size), 0);
+    EXPECT_TRUE(log.contains("findID3v2 : Not enough input data\n"));
+}
+
+TEST_F(Id3, FindsATagBehind256BytesOfOtherData) {
+    const Bytes tag = tkb::id3_tag(3, tkb::id3_frames(3, {text_frame("TIT2", 0, text("late"))}));
+    open(tkb::cat({Bytes(256, 0xEE), tag, kAudio}));
+    ASSERT_EQ(parse(), 1);
+    EXPECT_EQ(str(info().Title), "late");
+    EXPECT_EQ(cb_tell64(&reader), 256u + tag.size());
+}
+
+TEST_F(Id3, ReadsALargeTagInTwoPartsAndStopsJustAfterIt) {
+    Bytes jpeg = tkb::pattern(39000, 0x11);
+    Bytes apic = tkb::cat({Bytes{0}, text("image/png"), Bytes{0, 3, 0}, jpeg});
+    const Bytes body = tkb::id3_frames(3, {{"APIC", apic}, text_frame("TALB", 0, text("tail"))});
+    const Bytes tag = tkb::id3_tag(3, body, 40000 - 10 - body.size());
+    ASSERT_EQ(tag.size(), 40000u);
+    open(tkb::cat({tag, kAudio}));
+    ASSERT_EQ(parse(), 1);
+    EXPECT_EQ(ctx.id3_v2_size, 40000);
+    EXPECT_EQ(cb_tell64(&reader), 40000u);
+    EXPECT_EQ(str(info().Album), "tail");
+    ASSERT_EQ(info().Pic.length, 39000);
+    EXPECT_EQ(Bytes(info().Pic.payload, info().Pic.payload + 39000), jpeg);
+    EXPECT_EQ(info().pic_offset, 10u + 10u + 1u + 10u + 2u);
+    uint8_t next = 0;
+    ASSERT_EQ(reader.cb_read(&reader, &next, 1), 1);
+    EXPECT_EQ(next, kAudio[0]);
+}
+
+TEST_F(Id3, PicturesFindTheirDataBehindTypeAndDescription) {
+    const Bytes data = tkb::pattern(50, 0x40);
+    struct Case {
+        const char* name;
+        int version;
+        Id3Frame frame;
+        int length;
+        uint32_t data_at;  // offset of the picture data in the frame body
+        bool taken = true;
+    };
+    const Case cases[] = {
+        {"latin-1 description", 3,
+         {"APIC", tkb::cat({Bytes{0}, text("image/jpeg"), Bytes{0, 3}, text("front"), Bytes{0}, data})},
+         50, 1 + 11 + 1 + 6},
+        {"UTF-16 description", 3,
+         {"APIC", tkb::cat({Bytes{1}, text("image/jpeg"), Bytes{0, 3, 0xFF, 0xFE, 'x', 0, 0, 0}, data})},
+         50, 1 + 11 + 1 + 6},
+        {"empty description", 4,
+         {"APIC", tkb::cat({Bytes{3}, text("image/png"), Bytes{0, 0, 0}, data})}, 50, 1 + 10 + 1 + 1},
+        {"version 2 image format", 2,
+         {"PIC", tkb::cat({Bytes{0}, text("PNG"), Bytes{3}, text("d"), Bytes{0}, data})}, 50, 1 + 3 + 1 + 2},
+        {"MIME type without terminator", 3, {"APIC", tkb::cat({Bytes{0}, text("image/jpeg")})}, 0, 0, false},
+        {"no room for the picture type", 3, {"APIC", tkb::cat({Bytes{0}, text("image"), Bytes{0}})}, 0, 0, false},
+        {"description runs to the end: empty picture", 3,
+         {"APIC", tkb::cat({Bytes{0}, text("i"), Bytes{0, 3}, text("no end")})}, 0, 1 + 2 + 1 + 6},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.name);
+        testenv::LogCapture log;
+        open(tkb::cat({tkb::id3_tag(c.version, tkb::id3_frames(c.version, {c.frame}), 4), kAudio}));
+        ASSERT_EQ(parse(), 1);
+        EXPECT_EQ(info().Pic.length, c.length);
+        if (c.taken) {
+            const uint32_t header = c.version == 2 ? 6 : 10;
+            EXPECT_EQ(info().pic_offset, 10 + header + c.data_at);
+            EXPECT_EQ(info().Pic.payload, ctx.id3_info_buffer + info().pic_offset);
+            EXPECT_EQ(Bytes(info().Pic.payload, info().Pic.payload + c.length),
+                      Bytes(data.begin(), data.begin() + c.length));
+            EXPECT_TRUE(info().eID3TagFlags & ID3_APIC);
+            hova_program_info_st program{};
+            get_id3_info(&program, &info());
+            EXPECT_EQ(program.cover.length, c.length);
+            EXPECT_EQ(program.pic_offset, static_cast<int>(info().pic_offset));
+        } else {
+            EXPECT_FALSE(info().eID3TagFlags & ID3_APIC);
+            EXPECT_TRUE(log.contains("[Pic] u32FrameSize error\n"));
+        }
+        close();
+    }
+}
+
+TEST_F(Id3, UndoesUnsynchronisationOnTheStoredBytes) {
+    struct Case {
+        Bytes stored;
+        Bytes text;
+    };
+    const Case cases[] = {
+        {{0xFF, 0x00, 0x00}, {0xFF, 0x00}},
+        {{0xFF, 0x00, 0xE0}, {0xFF, 0xE0}},
+        {{0xFF, 0xFF, 0x00, 0x00}, {0xFF, 0xFF, 0x00}},
+        {{0x00, 0xFF}, {0x00, 0xFF}},
+    };
+    for (const auto& c : cases) {
+        // The frame's size field counts the bytes after unsynchronisation.
+        Bytes body = {'T', 'I', 'T', '2', 0, 0, 0, static_cast<uint8_t>(1 + c.text.size()), 0, 0, 0};
+        body.insert(body.end(), c.stored.begin(), c.stored.end());
+        testenv::LogCapture log;
+        open(tkb::cat({tkb::id3_tag(3, body, 0, 0x80), kAudio}));
+        ASSERT_EQ(parse(), 1);
+        EXPECT_TRUE(log.contains("[parseID3v2] parse unsynchronization\n"));
+        EXPECT_EQ(info().u32ID3TagSize, body.size() - (c.stored.size() - c.text.size()));
+        EXPECT_EQ(Bytes(info().Title.payload, info().Title.payload + info().Title.size), c.text);
+        close();
+    }
+}
+
+TEST_F(Id3, ChoosesBetweenSyncsafeAndPlainFrameSizesInVersion4) {
+    const Bytes v256 = tkb::pattern(255, 0x30);
+    const Bytes v128 = tkb::pattern(127, 0x30);
+    struct Case {
+        const char* name;
+        std::vector<Id3Frame> frames;
+        int result_title_size;  // -1: the walk stopped at the bad size
+    };
+    // 0x00000100 read as syncsafe is 128.
+    Id3Frame plain{"TIT2", tkb::cat({Bytes{0}, v256}), 256, true};
+    Id3Frame syncsafe{"TIT2", tkb::cat({Bytes{0}, v128}), 128, false};
+    const Case cases[] = {
+        {"plain size when only it leads to a frame", {plain, text_frame("TALB", 0, text("x"))}, 255},
+        {"syncsafe size when it leads to a frame", {syncsafe, text_frame("TALB", 0, text("x"))}, 127},
+        {"neither leads to a frame", {plain, text_frame("talb", 0, text("x"))}, -1},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.name);
+        testenv::LogCapture log;
+        open(tkb::cat({tkb::id3_tag(4, tkb::id3_frames(4, c.frames), 64), kAudio}));
+        ASSERT_EQ(parse(), 1);
+        if (c.result_title_size < 0) {
+            EXPECT_EQ(info().eID3TagFlags, 0u);
+            EXPECT_TRUE(log.contains("[parseID3v2] check tag fail\n"));
+        } else {
+            EXPECT_EQ(info().Title.size, static_cast<unsigned>(c.result_title_size));
+            EXPECT_EQ(str(info().Album), "x");
+        }
+        close();
+    }
+}
+
+TEST_F(Id3, StopsTheFrameWalkAtPaddingAndBadSizes) {
+    struct Case {
+        const char* name;
+        Bytes body;
+        uint32_t flags;
+        const char* log_line;
+    };
+    const Bytes title = tkb::id3_frames(3, {text_frame("TIT2", 0, text("t"))});
+    const Bytes album = tkb::id3_frames(3, {text_frame("TALB", 0, text("a"))});
+    const Case cases[] = {
+        {"padding ends the walk", tkb::cat({title, Bytes(20, 0), album}), ID3_TITLE, nullptr},
+        {"empty frame with an ID is passed over",
+         tkb::cat({tkb::id3_frames(3, {{"TPE1", {}}}), title, Bytes(12, 0)}), ID3_TITLE, nullptr},
+        {"size without an ID ends the walk",
+         tkb::cat({title, Bytes{0, 0, 0, 0, 0, 0, 0, 2, 0, 0, 'x', 'y'}, album, Bytes(12, 0)}), ID3_TITLE,
+         nullptr},
+        {"size past the tag ends the walk",
+         tkb::cat({title, tkb::id3_frames(3, {{"TALB", text("big"), 5000}}), Bytes(12, 0)}), ID3_TITLE,
+         nullptr},
+        {"unknown frames are skipped",
+         tkb::cat({tkb::id3_frames(3, {{"PRIV", text("owner")}}), album, Bytes(12, 0)}), ID3_ALBUM,
+         "[parseID3v2] unsupported TAG 50524956\n"},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.name);
+        testenv::LogCapture log;
+        open(tkb::cat({tkb::id3_tag(3, c.body), kAudio}));
+        ASSERT_EQ(parse(), 1);
+        EXPECT_EQ(info().eID3TagFlags, c.flags);
+        if (c.log_line) {
+            EXPECT_TRUE(log.contains(c.log_line));
+        }
+        close();
+    }
+}
+
+TEST_F(Id3, FallsBackToTheId3v1BlockAtTheEnd) {
+    struct Case {
+        const char* name;
+        Bytes head;
+        const char* log_line;
+    };
+    const Case cases[] = {
+        {"no ID3v2 tag", kAudio, "[parse_ID3] find_ID3v2 fail\n"},
+        {"ID3v2 version 5", tkb::cat({tkb::id3_tag(5, tkb::id3_frames(3, {text_frame("TIT2", 0, text("v5"))})), kAudio}),
+         "[parseID3v2] unsupport ID3v2 version\n"},
+        {"ID3v2 tag longer than the input",
+         tkb::cat({Bytes{'I', 'D', '3', 3, 0, 0, 0x7F, 0x7F, 0x7F, 0x7F}, kAudio}), "[parse_ID3] cb_read fail\n"},
+    };
+    const Bytes v1 = tkb::id3v1("Song", "Band", "Record", "1987", "fine", 17);
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.name);
+        testenv::LogCapture log;
+        open(tkb::cat({c.head, v1}));
+        ASSERT_EQ(parse(), 1);
+        EXPECT_TRUE(log.contains(c.log_line));
+        EXPECT_TRUE(log.contains("[parseID3v1]Parse OK\n"));
+        EXPECT_EQ(info().eID3TagFlags, 63u);
+        EXPECT_EQ(str(info().Title), std::string("Song") + '\0');  // size counts the NUL
+        EXPECT_EQ(info().Title.size, 5u);
+        EXPECT_EQ(info().Artist.payload, ctx.id3_info_buffer + 31);
+        EXPECT_EQ(info().Album.payload, ctx.id3_info_buffer + 62);
+        EXPECT_EQ(info().Year.payload, ctx.id3_info_buffer + 93);
+        EXPECT_EQ(info().Comment.payload, ctx.id3_info_buffer + 98);
+        EXPECT_EQ(info().Genre.payload, ctx.id3_info_buffer + 129);
+        EXPECT_EQ(info().Year.stringformat, HOVA_STRING_FORMAT_ASCII);
+        EXPECT_EQ(ctx.id3_v1_size, 128);
+        EXPECT_EQ(cb_tell64(&reader), 0u);
+        EXPECT_EQ(input->counters().open_done_calls, 1u);
+        hova_program_info_st program{};
+        get_id3_info(&program, &info());
+        EXPECT_EQ(program.year, 1987);
+        ASSERT_NE(program.genre, nullptr);
+        EXPECT_STREQ(program.genre, "Rock");
+        close();
+    }
+}
+
+TEST_F(Id3, Id3v1GenreByteSelectsTheGenreName) {
+    struct Case {
+        uint8_t genre;
+        unsigned size;
+        const char* name;
+    };
+    for (const Case c : {Case{0, 1, nullptr}, Case{17, 2, "Rock"}, Case{147, 2, "Synthpop"},
+                         Case{148, 2, ""}, Case{149, 2, nullptr}, Case{255, 2, nullptr}}) {
+        SCOPED_TRACE(static_cast<int>(c.genre));
+        open(tkb::cat({kAudio, tkb::id3v1("t", "a", "b", "2000", "c", c.genre)}));
+        ASSERT_EQ(parse(), 1);
+        EXPECT_EQ(info().Genre.size, c.size);
+        hova_program_info_st program{};
+        get_id3_info(&program, &info());
+        if (c.name) {
+            ASSERT_NE(program.genre, nullptr);
+            EXPECT_STREQ(program.genre, c.name);
+        } else {
+            EXPECT_EQ(program.genre, nullptr);
+        }
+        close();
+    }
+}
+
+TEST_F(Id3, LooksNoFurtherWhenThereIsNoTagToBeFound) {
+    struct Case {
+        const char* name;
+        Bytes file;
+        bool seekable;
+        bool size_known;
+        uint64_t open_done;
+        const char* log_line;
+    };
+    const Case cases[] = {
+        {"127 bytes", tkb::pattern(127, 1), true, true, 0, "[parse_ID3] cb_read fail\n"},
+        {"not seekable", tkb::cat({kAudio, tkb::id3v1("t", "a", "b", "y", "c", 1)}), false, true, 0, nullptr},
+        {"size unknown", tkb::cat({kAudio, tkb::id3v1("t", "a", "b", "y", "c", 1)}), true, false, 0, nullptr},
+        {"no ID3v1 block", kAudio, true, true, 1, "[parseID3v1]No ID3v1 tag\n"},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.name);
+        testenv::LogCapture log;
+        host::InputOptions opts;
+        opts.seekable = c.seekable;
+        open(c.file, opts);
+        const size_t reader_blocks = host.outstanding_blocks();
+        if (!c.size_known) ctx.file_size = ~cb_fpos{0};
+        const uint64_t read_before = input->counters().bytes_read;
+        EXPECT_EQ(parse(), 0);
+        EXPECT_EQ(ctx.id3_info_buffer, nullptr);
+        EXPECT_EQ(host.outstanding_blocks(), reader_blocks) << "only the reader's own blocks";
+        EXPECT_EQ(cb_tell64(&reader), 0u);
+        EXPECT_EQ(input->counters().open_done_calls, c.open_done);
+        if (c.log_line) {
+            EXPECT_TRUE(log.contains(c.log_line));
+        }
+        if (c.open_done == 0) {
+            EXPECT_LE(input->counters().bytes_read - read_before, c.file.size());
+        }
+        close();
+    }
+}
+
+// Every host allocation of a parse fails in turn: the parse degrades (to the
+// ID3v1 block, or to nothing) and nothing stays allocated unless a tag was taken.
+TEST_F(Id3, SurvivesEachAllocationFailing) {
+    const Bytes v2 = tkb::id3_tag(3, tkb::id3_frames(3, {text_frame("TIT2", 0, text("two"))}));
+    const Bytes v1 = tkb::id3v1("one", "a", "b", "1999", "c", 2);
+    for (const Bytes& file : {tkb::cat({v2, kAudio, v1}), tkb::cat({kAudio, v1})}) {
+        for (uint64_t n = 1; n <= 3; ++n) {
+            SCOPED_TRACE(n);
+            open(file);
+            const size_t reader_blocks = host.outstanding_blocks();
+            host.fail_malloc_at(n);
+            const int r = parse();
+            host.fail_malloc_at(0);
+            if (r == 1) {
+                EXPECT_NE(ctx.id3_info_buffer, nullptr);
+                EXPECT_EQ(host.outstanding_blocks(), reader_blocks + 1);
+                EXPECT_TRUE(str(info().Title) == "two" || str(info().Title) == std::string("one") + '\0');
+            } else {
+                EXPECT_EQ(ctx.id3_info_buffer, nullptr);
+                EXPECT_EQ(host.outstanding_blocks(), reader_blocks);
+            }
+            close();
+        }
+    }
+}
+
+TEST_F(Id3, TruncatedInputsNeverLeakOrOverread) {
+    const Bytes tag = tkb::id3_tag(4, tkb::id3_frames(4, {text_frame("TIT2", 0, text("title")),
+                                                          {"APIC", tkb::cat({Bytes{0}, text("a/b"), Bytes{0, 3, 0}, tkb::pattern(300, 1)})}}));
+    const Bytes file = tkb::cat({tag, tkb::pattern(100, 2)});
+    for (size_t n = 0; n <= file.size(); n += 7) {
+        SCOPED_TRACE(n);
+        const Bytes cut(file.begin(), file.begin() + static_cast<long>(n));
+        open(cut);
+        const int r = parse();
+        EXPECT_EQ(r == 1, n >= tag.size() && n >= 266);
+        EXPECT_EQ(ctx.id3_info_buffer != nullptr, r == 1);
+        close();
+    }
+}
+
+TEST(Id3Helpers, SmallPiecesBehaveAtTheirEdges) {
+    const uint8_t ids[] = {'T', 'I', 'T', '2', 'a', 'B', 'C', 'D', '9', '0', 'Z', 'A'};
+    EXPECT_EQ(check_tag(ids, sizeof ids, 0), 1);
+    EXPECT_EQ(check_tag(ids, sizeof ids, 4), 0);   // lower case
+    EXPECT_EQ(check_tag(ids, sizeof ids, 8), 1);
+    EXPECT_EQ(check_tag(ids, sizeof ids, 9), -1);  // past the end
+    EXPECT_EQ(check_tag(ids, sizeof ids, UINT32_MAX - 1), -1);
+
+    const uint8_t syncsafe[] = {0x7F, 0x7F, 0x7F, 0x7F};
+    EXPECT_EQ(calc_ID3v2_size(syncsafe), 0x0FFFFFFFu);
+    const uint8_t high_bits[] = {0x80, 0x81, 0x80, 0x80};
+    EXPECT_EQ(calc_ID3v2_size(high_bits), 1u << 14);
+
+    const uint8_t field[] = {'a', 'b', 0, 'c', 'd', 'e'};
+    const uint8_t* cursor = field;
+    uint8_t out[8];
+    unsigned len = 0;
+    copy_id3_tag(&cursor, 5, out, &len);
+    EXPECT_EQ(len, 3u);
+    EXPECT_EQ(cursor, field + 5);
+    EXPECT_EQ(out[5], 0);
+
+    const std::pair<uint8_t, hova_string_format_et> formats[] = {
+        {0, HOVA_STRING_FORMAT_ASCII}, {1, HOVA_STRING_FORMAT_UCS2}, {2, HOVA_STRING_FORMAT_UTF16BE},
+        {3, HOVA_STRING_FORMAT_UTF8}, {200, HOVA_STRING_FORMAT_UTF8}};
+    for (auto [enc, fmt] : formats) EXPECT_EQ(parse_string_format(enc), fmt);
+
+    uint8_t frame[] = {3, 'x', 'y', 'z'};
+    move_zero_to_string_end(frame, 4);
+    EXPECT_EQ(Bytes(frame, frame + 4), (Bytes{'x', 'y', 'z', 0}));
+}
+
+TEST(Id3Helpers, NumbersReadLeadingDigitsOnly) {
+    const std::pair<std::string, int> cases[] = {
+        {"1999", 1999}, {"  -12abc", -12}, {"+7", 7}, {"", 0},
+        {"x12", 0}, {"99999999999", INT_MAX}, {"-99999999999", INT_MIN},
+    };
+    for (const auto& [textv, value] : cases) {
+        std::string buf = textv;
+        ST_ID3_INFO id3{};
+        id3.eID3TagFlags = ID3_YEAR | ID3_DISCNUMBER;
+        id3.Year = {static_cast<unsigned>(buf.size()), reinterpret_cast<unsigned char*>(buf.data()),
+                    HOVA_STRING_FORMAT_ASCII};
+        id3.DiscNumber = id3.Year;
+        hova_program_info_st program{};
+        get_id3_info(&program, &id3);
+        EXPECT_EQ(program.year, value) << textv;
+        EXPECT_EQ(program.disc_number, value) << textv;
+        EXPECT_EQ(program.track_number, 0) << "not flagged, not touched";
+    }
+}
+
+}  // namespace
