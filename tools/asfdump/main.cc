@@ -55,7 +55,10 @@ int main(int argc, char** argv) {
     if (!load_plugin(loader, opts, argv[0])) return asfdump::kExitOpenFailed;
     const hova_dmx_func_st* dmx = loader.descriptor();
 
+    // The plug-in's log goes to stderr only when asked for.
+    if (!opts.log) setenv("PLIMO_LOG", "off", 1);
     if (opts.command == "probe") return asfdump::run_probe(dmx, opts);
+    if (opts.command == "info") return asfdump::run_info(dmx, opts);
     std::fprintf(stderr, "asfdump: %s is not available yet\n", opts.command.c_str());
     return asfdump::kExitUsage;
 }
