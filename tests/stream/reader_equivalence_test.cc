@@ -1,0 +1,140 @@
+// Every mode against a plain model of the file: random reads, peeks and
+// seeks over random data give the same bytes, positions and end-of-input
+// answers whatever the buffering. Also the seek/thread hand-over under
+// stress: after an out-of-buffer seek the reader sees only bytes from the
+// new position, in order.
+#include <atomic>
+#include <thread>
+
+#include "reader_fixture.h"
+#include "stream_internal.h"
+
+using namespace readertest;
+
+namespace {
+
+struct Model {
+    const std::vector<uint8_t>& data;
+    uint64_t pos = 0;
+    std::vector<uint8_t> take(uint64_t n) const {
+        if (pos >= data.size()) return {};
+        n = std::min<uint64_t>(n, data.size() - pos);
+        return {data.begin() + static_cast<long>(pos), data.begin() + static_cast<long>(pos + n)};
+    }
+};
+
+void run_random_ops(Mode mode, uint32_t seed) {
+    std::mt19937 rng(seed);
+    const size_t size = 3000 + rng() % 60000;
+    const int block = 16 + static_cast<int>(rng() % 2048);
+    const int ring = block + 1 + static_cast<int>(rng() % (4 * block));
+    SCOPED_TRACE(testing::Message() << mode_name(mode) << " seed " << seed << " size " << size
+                                    << " block " << block << " ring " << ring);
+    Reader r(pattern(size, seed), options_for(mode, block, ring));
+    ASSERT_EQ(r.open(mode), 0);
+    Model m{r.data_};
+    const bool ringed = mode == Mode::SyncRing || mode == Mode::Thread;
+    const int32_t max_peek = ringed ? ring - block : 3 * block;
+    std::vector<uint8_t> buf;
+    for (int op = 0; op < 400; ++op) {
+        const unsigned kind = rng() % 10;
+        if (kind < 5) {
+            // Reads from tiny to several blocks.
+            const int32_t n = static_cast<int32_t>(rng() % 3 == 0 ? rng() % (3 * block + 5) : rng() % 40);
+            buf.assign(static_cast<size_t>(n), 0);
+            const int32_t got = r.read(buf.data(), n);
+            buf.resize(static_cast<size_t>(std::max(got, 0)));
+            const auto want = m.take(static_cast<uint64_t>(n));
+            ASSERT_EQ(buf, want) << "read " << n << " at " << m.pos << " op " << op;
+            m.pos += want.size();
+            if (n > 0) {
+                ASSERT_EQ(cb_status(&r.cb_),
+                          want.size() < static_cast<size_t>(n) ? CB_ERR_EOF : CB_ERR_OK);
+            }
+        } else if (kind < 7) {
+            const int32_t n = 1 + static_cast<int32_t>(rng() % static_cast<uint32_t>(max_peek));
+            buf.assign(static_cast<size_t>(n), 0);
+            const int32_t got = r.peek(buf.data(), n);
+            buf.resize(static_cast<size_t>(std::max(got, 0)));
+            const auto want = m.take(static_cast<uint64_t>(n));
+            ASSERT_EQ(buf, want) << "peek " << n << " at " << m.pos << " op " << op;
+            ASSERT_EQ(cb_status(&r.cb_), want.size() < static_cast<size_t>(n) ? CB_ERR_EOF : CB_ERR_OK);
+        } else {
+            // Seeks near the position (often inside the buffer) or anywhere.
+            cb_off_t target;
+            if (rng() % 2) {
+                target = static_cast<cb_off_t>(m.pos) + static_cast<cb_off_t>(rng() % (2 * block)) - block / 2;
+            } else {
+                target = static_cast<cb_off_t>(rng() % (size + 100));
+            }
+            if (target < 0) target = 0;
+            cb_off_t got;
+            if (kind == 7) {
+                got = r.seek(target, CB_SEEK_SET);
+            } else if (kind == 8) {
+                got = r.seek(target - static_cast<cb_off_t>(m.pos), CB_SEEK_CUR);
+            } else if (mode != Mode::Thread) {
+                // The thread's set has no seek from the end.
+                target = static_cast<cb_off_t>(size) - static_cast<cb_off_t>(rng() % 100);
+                got = r.seek(target - static_cast<cb_off_t>(size), CB_SEEK_END);
+            } else {
+                got = cb_seek_multi(&r.cb_, static_cast<int32_t>(target), CB_SEEK_SET);
+            }
+            ASSERT_EQ(got, target) << "seek op " << op;
+            m.pos = static_cast<uint64_t>(target);
+        }
+        ASSERT_EQ(cb_tell64(&r.cb_), m.pos) << "op " << op;
+    }
+}
+
+}  // namespace
+
+TEST(ReaderEquivalence, EveryModeMatchesThePlainFile) {
+    for (Mode mode : {Mode::None, Mode::Cache, Mode::SyncRing, Mode::Thread}) {
+        for (uint32_t seed = 1; seed <= 12; ++seed) {
+            run_random_ops(mode, seed);
+            if (HasFatalFailure()) return;
+        }
+    }
+}
+
+TEST(ReaderEquivalence, SeeksNeverLetStaleOrMissingBlocksThrough) {
+    // Tiny blocks and ring, and an input that sometimes yields or naps inside
+    // its reads, so that seeks land in every phase of the thread's loop:
+    // before its read, during it, between read and store, waiting for room.
+    constexpr size_t kSize = 1 << 18;
+    Reader r(pattern(kSize, 99), options_for(Mode::Thread, 37, 37 * 3 + 5));
+    std::atomic<uint32_t> tick{0};
+    r.in_->faults().before_read = [&](uint64_t, size_t) {
+        const uint32_t t = tick.fetch_add(1);
+        if (t % 7 == 0) std::this_thread::yield();
+        if (t % 97 == 0) std::this_thread::sleep_for(std::chrono::microseconds(50));
+    };
+    ASSERT_EQ(r.open(), 0);
+    std::mt19937 rng(5);
+    uint64_t pos = 0;
+    uint8_t buf[64];
+    int out_of_buffer = 0;
+    for (int i = 0; i < 6000; ++i) {
+        const unsigned k = rng() % 4;
+        if (k == 0) {
+            // Outside the buffered bytes: backward, or well beyond the ring.
+            const uint64_t target = rng() % 2 ? rng() % (pos + 1)
+                                              : std::min<uint64_t>(kSize, pos + 200 + rng() % 5000);
+            const uint64_t seeks = r.in_->counters().seeks;
+            ASSERT_EQ(r.seek(static_cast<cb_off_t>(target), CB_SEEK_SET), static_cast<cb_off_t>(target));
+            out_of_buffer += r.in_->counters().seeks != seeks;
+            pos = target;
+        }
+        const int32_t n = 1 + static_cast<int32_t>(rng() % 60);
+        const int32_t got = r.read(buf, n);
+        const auto want = r.slice(pos, static_cast<size_t>(n));
+        ASSERT_EQ(std::vector<uint8_t>(buf, buf + got), want) << "at " << pos << " step " << i;
+        pos += want.size();
+        if (pos >= kSize) {
+            ASSERT_EQ(r.seek(0, CB_SEEK_SET), 0);
+            pos = 0;
+        }
+    }
+    EXPECT_GT(out_of_buffer, 1000);
+}
