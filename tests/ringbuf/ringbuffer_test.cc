@@ -30,6 +30,17 @@ struct Ring {
     sys_ringbuffer rb{};
 };
 
+// Waits until a producer has announced its request (read under the lock).
+void wait_for_producer(sys_ringbuffer* rb, int32_t len) {
+    for (;;) {
+        pthread_mutex_lock(&rb->ring_mutex);
+        const int32_t req = rb->wsize_req;
+        pthread_mutex_unlock(&rb->ring_mutex);
+        if (req == len) return;
+        std::this_thread::yield();
+    }
+}
+
 std::vector<uint8_t> seq(uint8_t first, size_t n) {
     std::vector<uint8_t> v(n);
     for (size_t i = 0; i < n; ++i) v[i] = static_cast<uint8_t>(first + i);
@@ -173,7 +184,7 @@ TEST(Ring, ReleaseWakesTheProducerOnlyOnceItsRequestFits) {
     r.write(seq(1, 7));
     std::atomic<int32_t> result{-100};
     std::thread producer([&] { result = sys_ringbuffer_walloc(&r.rb, 6); });
-    while (__atomic_load_n(&r.rb.wsize_req, __ATOMIC_ACQUIRE) != 6) std::this_thread::yield();
+    wait_for_producer(&r.rb, 6);
     sys_ringbuffer_byte_release(&r.rb, 3);  // 3 free: not enough
     std::this_thread::sleep_for(std::chrono::milliseconds(50));
     EXPECT_EQ(result.load(), -100) << "woken although 6 bytes do not fit";
@@ -190,7 +201,7 @@ TEST(Ring, FlushOrCloseEndsAWaitingProducer) {
         r.write(seq(1, 7));
         std::atomic<int32_t> result{-100};
         std::thread producer([&] { result = sys_ringbuffer_walloc(&r.rb, 4); });
-        while (__atomic_load_n(&r.rb.wsize_req, __ATOMIC_ACQUIRE) != 4) std::this_thread::yield();
+        wait_for_producer(&r.rb, 4);
         if (flush)
             sys_ringbuffer_flush(&r.rb);
         else
