@@ -59,6 +59,7 @@ int main(int argc, char** argv) {
     if (!opts.log) setenv("PLIMO_LOG", "off", 1);
     if (opts.command == "probe") return asfdump::run_probe(dmx, opts);
     if (opts.command == "info") return asfdump::run_info(dmx, opts);
+    if (opts.command == "frames") return asfdump::run_frames(dmx, opts);
     std::fprintf(stderr, "asfdump: %s is not available yet\n", opts.command.c_str());
     return asfdump::kExitUsage;
 }
