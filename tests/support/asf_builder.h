@@ -152,6 +152,8 @@ Bytes content_description_raw(const uint16_t (&lengths)[5], const Bytes& strings
                               std::optional<uint64_t> declared = {});
 
 struct Descriptor {
+    Descriptor(std::string n = {}, uint16_t type = 0, Bytes v = {})
+        : name(std::move(n)), data_type(type), value(std::move(v)) {}
     std::string name;
     uint16_t data_type = 0;
     Bytes value;

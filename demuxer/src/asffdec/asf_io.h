@@ -30,12 +30,15 @@ inline uint64_t read(asf_demuxer_st* d, void* dst, uint64_t n) {
     return read(d, dst, n) == n;
 }
 
-// Moves forward by n bytes from the current position. A distance that does
-// not fit a signed offset would be a backward seek: refused.
+// Moves forward by n bytes from the current position. A target beyond the
+// largest signed position cannot be reached (and would wrap into a backward
+// seek): refused.
 [[nodiscard]] inline bool skip(asf_demuxer_st* d, uint64_t n) {
     if (n == 0) return true;
-    if (n > static_cast<uint64_t>(INT64_MAX)) return false;
     cb_buffer_st* cb = &d->s.cbuffer;
+    if (cb->curpos > static_cast<uint64_t>(INT64_MAX) ||
+        n > static_cast<uint64_t>(INT64_MAX) - cb->curpos)
+        return false;
     return cb->cb_seek64(cb, static_cast<cb_off_t>(n), CB_SEEK_CUR) != -1;
 }
 

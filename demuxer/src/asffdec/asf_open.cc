@@ -90,7 +90,7 @@ void asf_parse_index(asf_demuxer_st* d) {
         }
         const auto size = static_cast<cb_off_t>(load_le<uint64_t>(h + asf::kObjSize));
         if (size < 1) return;
-        if (cb->cb_seek64(cb, size, CB_SEEK_CUR) == -1) return;
+        if (!asf::skip(d, static_cast<uint64_t>(size))) return;
     }
     if (d->index_packet != 0) d->index_start_offset = -1;
 }
@@ -156,9 +156,7 @@ extern "C" int asf_init_demuxer(void** ctx, cb_io_st* cbio, void* buffer, int bu
     // its own header would be a backward seek: the index is then unreachable.
     const uint64_t data_size = load_le<uint64_t>(data_obj + asf::kObjSize);
     if (data_size >= asf::data_object::kSize &&
-        data_size - asf::data_object::kSize <= static_cast<uint64_t>(INT64_MAX) &&
-        rd->cb_seek64(rd, static_cast<cb_off_t>(data_size - asf::data_object::kSize),
-                      CB_SEEK_CUR) != -1)
+        asf::skip(d, data_size - asf::data_object::kSize))
         asf_parse_index(d);
 
     if (d->s.streaming) d->s.seekable = asf_judge_streaming_seekable(d);
