@@ -262,9 +262,11 @@ TEST(Metadata, EntriesRunningPastTheirObject) {
     Bytes ecd = asfb::extended_content_description({overrun, {"WM/Year", 0, asfb::string_value("2000")}});
     // Value length of the first descriptor: after count(2), name length(2),
     // name (28 bytes), type(2).
+    // A length below the object's size but beyond what is left of it.
     const size_t vlen_at = 24 + 2 + 2 + 28 + 2;
-    ecd[vlen_at] = 0xF0;
-    ecd[vlen_at + 1] = 0x00;
+    const size_t v = ecd.size() - 10;
+    ecd[vlen_at] = static_cast<uint8_t>(v);
+    ecd[vlen_at + 1] = static_cast<uint8_t>(v >> 8);
     Bytes lib = asfb::metadata_library({{0, 0, "WM/Picture", 1, asfb::picture_value(3, "", "", Bytes(40, 1))}});
     lib[24 + 2 + 8] = 0xFF;  // data length far beyond the object
     const struct {
