@@ -249,3 +249,18 @@ TEST(Ring, ProducerAndConsumerPassEveryByteInOrder) {
     EXPECT_TRUE(ok);
     EXPECT_EQ(sys_ringbuffer_avail(&r.rb), 0);
 }
+
+TEST(Ring, ReadConsumesWhatItCopies) {
+    Ring r(8);
+    r.rb.pread = r.rb.pwrite = 6;
+    r.write(seq(1, 5));
+    uint8_t out[4];
+    EXPECT_EQ(sys_ringbuffer_byte_read(&r.rb, out, 4), 4);
+    EXPECT_EQ(std::vector<uint8_t>(out, out + 4), seq(1, 4));
+    EXPECT_EQ(r.rb.pread, 2u);
+    EXPECT_EQ(r.rb.pkt_cnt, 1u);
+    EXPECT_EQ(r.rb.srlock, 0);
+    r.rb.buf_eos = 1;
+    EXPECT_EQ(sys_ringbuffer_byte_read(&r.rb, nullptr, 4), 1) << "skips what is held";
+    EXPECT_EQ(sys_ringbuffer_empty(&r.rb), 1);
+}

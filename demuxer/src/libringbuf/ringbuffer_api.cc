@@ -159,18 +159,6 @@ int32_t sys_ringbuffer_walloc(sys_ringbuffer* rb, uint32_t len) {
     return free_space;
 }
 
-void sys_ringbuffer_byte_release(sys_ringbuffer* rb, uint32_t len) {
-    pthread_mutex_lock(&rb->ring_mutex);
-    uint32_t p = rb->pread + len;
-    if (p >= rb->size) p -= rb->size;
-    rb->pread = p;
-    store_cnt(rb, load_cnt(rb) - len);
-    if (rb->wsize_req != 0 && sys_ringbuffer_free_internal(rb) >= rb->wsize_req)
-        pthread_cond_signal(&rb->ring_free_cond);
-    rb->srlock = 0;
-    pthread_mutex_unlock(&rb->ring_mutex);
-}
-
 int32_t sys_ringbuffer_read_peek(sys_ringbuffer* rb, uint8_t* dst, uint32_t len, uint32_t skip) {
     uint32_t start = rb->pread + skip;
     if (start >= rb->size) start -= rb->size;
@@ -184,8 +172,11 @@ int32_t sys_ringbuffer_read_peek(sys_ringbuffer* rb, uint8_t* dst, uint32_t len,
     return static_cast<int32_t>(len);
 }
 
-int32_t sys_ringbuffer_byte_read_peek(sys_ringbuffer* rb, uint8_t* dst, int32_t len) {
-    pthread_mutex_lock(&rb->ring_mutex);
+namespace {
+
+// Consumer side of byte_read_peek, with the lock held: waits until `len`
+// bytes are held, end of stream, or the timed wait expires.
+uint32_t wait_and_copy_locked(sys_ringbuffer* rb, uint8_t* dst, int32_t len) {
     rb->rsize_req = len;
     rb->srlock = 1;
     int32_t avail = sys_ringbuffer_avail_internal(rb);
@@ -197,8 +188,41 @@ int32_t sys_ringbuffer_byte_read_peek(sys_ringbuffer* rb, uint8_t* dst, int32_t 
     if (static_cast<uint32_t>(len) < count) count = static_cast<uint32_t>(len);
     if (dst && count) sys_ringbuffer_read_peek(rb, dst, count, 0);
     rb->rsize_req = 0;
+    return count;
+}
+
+void release_locked(sys_ringbuffer* rb, uint32_t len) {
+    uint32_t p = rb->pread + len;
+    if (p >= rb->size) p -= rb->size;
+    rb->pread = p;
+    store_cnt(rb, load_cnt(rb) - len);
+    if (rb->wsize_req != 0 && sys_ringbuffer_free_internal(rb) >= rb->wsize_req)
+        pthread_cond_signal(&rb->ring_free_cond);
+    rb->srlock = 0;
+}
+
+}  // namespace
+
+int32_t sys_ringbuffer_byte_read_peek(sys_ringbuffer* rb, uint8_t* dst, int32_t len) {
+    pthread_mutex_lock(&rb->ring_mutex);
+    const uint32_t count = wait_and_copy_locked(rb, dst, len);
     pthread_mutex_unlock(&rb->ring_mutex);
     return static_cast<int32_t>(count);
+}
+
+int32_t sys_ringbuffer_byte_read(sys_ringbuffer* rb, uint8_t* dst, int32_t len) {
+    pthread_mutex_lock(&rb->ring_mutex);
+    const uint32_t count = wait_and_copy_locked(rb, dst, len);
+    if (count) release_locked(rb, count);
+    rb->srlock = 0;
+    pthread_mutex_unlock(&rb->ring_mutex);
+    return static_cast<int32_t>(count);
+}
+
+void sys_ringbuffer_byte_release(sys_ringbuffer* rb, uint32_t len) {
+    pthread_mutex_lock(&rb->ring_mutex);
+    release_locked(rb, len);
+    pthread_mutex_unlock(&rb->ring_mutex);
 }
 
 int32_t sys_ringbuffer_byte_read_peek_single_thread(sys_ringbuffer* rb, uint8_t* dst,

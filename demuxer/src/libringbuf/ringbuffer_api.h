@@ -54,6 +54,9 @@ int32_t sys_ringbuffer_read_peek(sys_ringbuffer* rb, uint8_t* dst, uint32_t len,
 /* Waits until `len` bytes are held (or end of stream, or the wait expires);
  * copies up to `len` into dst unless it is null; pread does not move. */
 int32_t sys_ringbuffer_byte_read_peek(sys_ringbuffer* rb, uint8_t* dst, int32_t len);
+/* The same wait and copy followed by the release, in one critical section:
+ * what a consumer that does not keep the bytes wants. */
+int32_t sys_ringbuffer_byte_read(sys_ringbuffer* rb, uint8_t* dst, int32_t len);
 int32_t sys_ringbuffer_byte_read_peek_single_thread(sys_ringbuffer* rb, uint8_t* dst, int32_t len);
 int32_t sys_ringbuffer_byte_write(sys_ringbuffer* rb, const uint8_t* src, uint32_t len);
 int32_t sys_ringbuffer_byte_write2(sys_ringbuffer* rb, uint32_t len);

@@ -58,8 +58,7 @@ int32_t cb_read_multi(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
     while (total < size) {
         int32_t want = size - total;
         if (want > cap) want = cap;
-        const int32_t n = sys_ringbuffer_byte_read_peek(rb, dst ? dst + total : nullptr, want);
-        if (n > 0) sys_ringbuffer_byte_release(rb, static_cast<uint32_t>(n));
+        const int32_t n = sys_ringbuffer_byte_read(rb, dst ? dst + total : nullptr, want);
         total += n;
         if (n < want) {
             cb->cb_errcode = short_outcome(rb);
