@@ -25,12 +25,24 @@ public:
     explicit Player(Bytes file, const host::InputOptions& in = {}, int ring_size = 1 << 20)
         : input_(host::RawInput::from_memory(std::move(file), in)),
           buffer_(static_cast<size_t>(hova_asff_demuxer.min_context_size), 0),
-          ring_size_(ring_size) {}
-    ~Player() { close(); }
+          ring_size_(ring_size) {
+        table_ = *host.table();
+        host_alloc_ = table_.stream_alloc;
+        table_.stream_alloc = &counted_alloc;
+        current() = this;
+    }
+    ~Player() {
+        close();
+        if (current() == this) current() = nullptr;
+    }
+
+    // The Nth stream_alloc from now on is refused (0: none).
+    void refuse_alloc_at(uint64_t n) { refuse_at_ = n ? alloc_calls + n : 0; }
+    uint64_t alloc_calls = 0;
 
     int open() {
         const int rc = hova_asff_demuxer.open_file(&ctx_, input_->io(), buffer_.data(),
-                                                   buffer_.size(), ring_size_, host.table());
+                                                   buffer_.size(), ring_size_, &table_);
         open_ = rc == HOVA_OK;
         return rc;
     }
@@ -85,6 +97,22 @@ public:
     std::vector<int> results;
 
 private:
+    static Player*& current() {
+        static Player* p = nullptr;
+        return p;
+    }
+    static int counted_alloc(void* ctx, hova_stream_type_et type, void** buffer, int size) {
+        Player* self = current();
+        if (++self->alloc_calls == self->refuse_at_) {
+            *buffer = nullptr;
+            return -1;
+        }
+        return self->host_alloc_(ctx, type, buffer, size);
+    }
+
+    hova_callback_st table_{};
+    int (*host_alloc_)(void*, hova_stream_type_et, void**, int) = nullptr;
+    uint64_t refuse_at_ = 0;
     std::unique_ptr<host::RawInput> input_;
     host::ContextBuffer buffer_;
     int ring_size_;
