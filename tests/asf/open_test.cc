@@ -180,6 +180,49 @@ TEST(Open, DataObjectShapes) {
     }
 }
 
+// Size fields of the data object and of the objects behind it, as the index
+// search reads them: open always succeeds, with or without the index.
+TEST(Open, HostileSizesBehindTheHeader) {
+    const uint64_t near32 = (1ull << 32) + 10, near64 = ~0ull - 10;
+    const asfb::Bytes unknown_body(40, 0);
+    const auto unknown = [&](std::optional<uint64_t> size) {
+        return asfb::object(asfb::guid_from_text("D6E229D3-35DA-11D1-9034-00A0C90349BE"),
+                            unknown_body, size);
+    };
+    const struct {
+        const char* what;
+        std::optional<uint64_t> data_size;
+        std::vector<Bytes> trailing;
+        bool index_found;
+    } cases[] = {
+        {"data object size 49", 49, {}, false},
+        {"data object size near 2^32", near32, {}, false},
+        {"data object size near 2^64", near64, {}, false},
+        {"object of size 0 before the index", std::nullopt, {unknown(0)}, false},
+        {"object of size 1 before the index", std::nullopt, {unknown(1)}, false},
+        {"object of size near 2^32 before the index", std::nullopt, {unknown(near32)}, false},
+        {"object of size near 2^64 before the index", std::nullopt, {unknown(near64)}, false},
+        {"well-formed object before the index", std::nullopt, {unknown(std::nullopt)}, true},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.what);
+        asfb::File f = asfb::standard_file(true, true, 2);
+        const Bytes header = asfb::header_object(f.header_children);
+        Bytes bytes = header;
+        const Bytes data = asfb::data_object(f.packets, c.data_size);
+        bytes.insert(bytes.end(), data.begin(), data.end());
+        for (const Bytes& t : c.trailing) bytes.insert(bytes.end(), t.begin(), t.end());
+        const Bytes index = asfb::simple_index(10000000, {{0, 1}, {1, 1}});
+        bytes.insert(bytes.end(), index.begin(), index.end());
+        Opened o = testsupport::open_bytes(bytes);
+        ASSERT_EQ(o.rc, HOVA_OK);
+        EXPECT_EQ(o.ctx()->index_packet != 0, c.index_found);
+        EXPECT_EQ(o.ctx()->index_count, c.index_found ? 2u : 0u);
+        EXPECT_EQ(o.ctx()->s.cbuffer.curpos, header.size() + 50) << "back at the first packet";
+        EXPECT_TRUE(o.close_clean());
+    }
+}
+
 TEST(Open, SkipsALeadingId3Tag) {
     for (uint32_t payload : {259u, 4096u}) {
         SCOPED_TRACE(payload);
