@@ -176,6 +176,44 @@ TEST_F(Id3, ReadsALargeTagInTwoPartsAndStopsJustAfterIt) {
     EXPECT_EQ(next, kAudio[0]);
 }
 
+TEST_F(Id3, ReadsTheSameTagsWithEveryBuffering) {
+    struct Case {
+        const char* name;
+        host::InputOptions opts;
+    };
+    host::InputOptions none, small_cache, ring;
+    none.disable_cache = true;
+    small_cache.block_size = 100;
+    ring.rbuf_mode = CBIO_APPLY_RBUF;
+    ring.use_thread = true;
+    ring.block_size = 1024;
+    ring.ring_size = 8192;
+    const Case cases[] = {{"no buffer", none}, {"cache smaller than the probe", small_cache},
+                          {"ring filled by the streaming thread", ring}};
+    const Bytes v2 = tkb::id3_tag(3, tkb::id3_frames(3, {text_frame("TIT2", 0, text("two")),
+                                                         {"PRIV", tkb::pattern(3000, 1)}}));
+    const Bytes v1 = tkb::id3v1("one", "a", "b", "1999", "c", 2);
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.name);
+        open(tkb::cat({Bytes(100, 0), v2, kAudio}), c.opts);
+        ASSERT_EQ(parse(), 1);
+        EXPECT_EQ(str(info().Title), "two");
+        EXPECT_EQ(cb_tell64(&reader), 100 + v2.size());
+        uint8_t next = 0;
+        ASSERT_EQ(reader.cb_read(&reader, &next, 1), 1);
+        EXPECT_EQ(next, kAudio[0]);
+        close();
+
+        open(tkb::cat({kAudio, v1}), c.opts);
+        ASSERT_EQ(parse(), 1);
+        EXPECT_EQ(info().Title.size, 4u);
+        EXPECT_EQ(cb_tell64(&reader), 0u);
+        ASSERT_EQ(reader.cb_read(&reader, &next, 1), 1);
+        EXPECT_EQ(next, kAudio[0]);
+        close();
+    }
+}
+
 TEST_F(Id3, PicturesFindTheirDataBehindTypeAndDescription) {
     const Bytes data = tkb::pattern(50, 0x40);
     struct Case {
