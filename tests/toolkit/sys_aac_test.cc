@@ -63,12 +63,6 @@ TEST(LatmValue, ReadsOneToFourBytesAfterItsByteCount) {
     }
 }
 
-TEST(LoasSampleRate, IsZeroOutsideTheIndexTable) {
-    const std::pair<int, uint32_t> cases[] = {{-1, 0}, {0, 96000}, {3, 48000}, {12, 7350},
-                                              {13, 0}, {15, 0},     {16, 0}};
-    for (auto [index, rate] : cases) EXPECT_EQ(aac_get_loas_sample_rate(index), rate) << index;
-}
-
 TEST(AudioSpecificConfigChannels, AcceptsOnlyKnownObjectTypesRatesAndLayouts) {
     struct Case {
         const char* name;

@@ -526,11 +526,6 @@ TEST(Id3Helpers, SmallPiecesBehaveAtTheirEdges) {
     EXPECT_EQ(cursor, field + 5);
     EXPECT_EQ(out[5], 0);
 
-    const std::pair<uint8_t, hova_string_format_et> formats[] = {
-        {0, HOVA_STRING_FORMAT_ASCII}, {1, HOVA_STRING_FORMAT_UCS2}, {2, HOVA_STRING_FORMAT_UTF16BE},
-        {3, HOVA_STRING_FORMAT_UTF8}, {200, HOVA_STRING_FORMAT_UTF8}};
-    for (auto [enc, fmt] : formats) EXPECT_EQ(parse_string_format(enc), fmt);
-
     uint8_t frame[] = {3, 'x', 'y', 'z'};
     move_zero_to_string_end(frame, 4);
     EXPECT_EQ(Bytes(frame, frame + 4), (Bytes{'x', 'y', 'z', 0}));

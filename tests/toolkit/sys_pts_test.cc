@@ -132,14 +132,6 @@ TEST(PtsGapRepair, LogsTheGapAndTheNewBase) {
     EXPECT_EQ(log.lines()[0].priority, 3);
 }
 
-TEST(StreamCount, AddsStreamsOfAllFourKinds) {
-    sys_demuxer_st d;
-    std::memset(&d, 0, sizeof d);
-    const int counts[4] = {2, 1, 3, 4};
-    std::memcpy(d.num_streams, counts, sizeof counts);
-    EXPECT_EQ(sys_get_cur_stream_num(&d), 10);
-}
-
 sys_stream_st stream_of(hova_stream_type_et type) {
     sys_stream_st s;
     std::memset(&s, 0, sizeof s);
