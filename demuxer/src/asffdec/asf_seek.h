@@ -1,0 +1,27 @@
+// Seeking by time: the packet search through the simple index or over the
+// data packets, and the reset of what delivery was assembling.
+#ifndef ASF_SEEK_H
+#define ASF_SEEK_H
+
+#include <cstdint>
+
+#include "asf_demuxer.h"
+
+// What the packet searches return when they cannot answer.
+inline constexpr uint64_t kAsfNoPacket = UINT64_MAX;
+
+// Packet of the video key frame for *pts through the simple index; *pts
+// becomes that key frame's time. kAsfNoPacket when the index cannot answer.
+uint64_t asf_find_packet_by_index(asf_demuxer_st* d, int dir, int64_t* pts);
+
+// Packet whose `target_type` object start is nearest *pts in direction `dir`,
+// found by interpolation and a packet scan; *pts becomes its time.
+// kAsfNoPacket when the search fails.
+uint64_t asf_find_packet_with_type(asf_demuxer_st* d, int dir, int64_t* pts,
+                                   hova_stream_type_et target_type);
+
+// Gives back the host frames of partly assembled audio and video objects and
+// clears their assembly state.
+void discard_pending_objects(asf_demuxer_st* d);
+
+#endif  // ASF_SEEK_H

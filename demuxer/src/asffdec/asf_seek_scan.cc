@@ -1,0 +1,131 @@
+// The search without index: three interpolation probes narrow the packet
+// range around the target, a fourth gives the start of a packet-by-packet
+// scan, which walks forward until it has times on both sides of the target,
+// turning back to walk earlier packets when it first meets a later time.
+#include "asf_seek.h"
+
+#include "asf_timestamp.h"
+#include "dprintf.h"
+#include "streaming.h"
+
+namespace {
+
+constexpr int kNarrowingProbes = 3;
+
+struct Candidate {
+    uint64_t packet = 0;
+    int64_t pts = -1;
+};
+
+// Packet at which the target lies if time grows evenly over [lower, upper).
+// The quotient is kept whole (128-bit product) and the target held inside the
+// range, so a far or early target lands on the range's edge, never on a
+// wrapped-around packet.
+uint64_t interpolate(int64_t target, uint64_t lower, uint64_t upper, int64_t start_time,
+                     int64_t stop_time, uint64_t num_packets) {
+    uint64_t q = 0;
+    if (target > start_time) {
+        const auto span = static_cast<unsigned __int128>(static_cast<uint64_t>(stop_time) -
+                                                         static_cast<uint64_t>(start_time));
+        const auto along = static_cast<unsigned __int128>(static_cast<uint64_t>(target) -
+                                                          static_cast<uint64_t>(start_time));
+        const unsigned __int128 v = along * (upper - lower) / span;
+        q = v > UINT64_MAX - lower ? UINT64_MAX - lower : static_cast<uint64_t>(v);
+    }
+    const uint64_t packet = lower + q;
+    return packet < num_packets - 1 ? packet : num_packets - 1;
+}
+
+}  // namespace
+
+uint64_t asf_find_packet_with_type(asf_demuxer_st* d, int dir, int64_t* pts,
+                                   hova_stream_type_et target_type) {
+    ASF_LOG("seek without index, type %d\n", static_cast<int>(target_type));
+    // Without packets there is nothing to find (and no last packet to hold
+    // a far target at).
+    if (d->num_packets == 0) return kAsfNoPacket;
+    cb_buffer_st* cb = &d->s.cbuffer;
+    const int64_t target = *pts;
+    // Network audio: one positioning and the first object start after it.
+    const bool single_probe = d->s.streaming && target_type == HOVA_STREAM_AUDIO;
+    uint64_t lower = 0, upper = d->num_packets;
+    int64_t start_time = 0, stop_time = d->s.duration;
+    uint64_t curr = 0;
+    int narrowing = kNarrowingProbes;
+    bool backward = false, got_forward = false, got_backward = false;
+    Candidate prev, next;
+
+    for (;;) {  // one interpolated positioning per pass
+        if (start_time < stop_time)
+            curr = interpolate(target, lower, upper, start_time, stop_time, d->num_packets);
+        const uint64_t init = curr;
+        if (cb->cb_seek64(cb, static_cast<cb_off_t>(asf_packet_position(d, curr)), CB_SEEK_SET) == -1)
+            return kAsfNoPacket;
+        asf_packet_st cursor{};
+        for (;;) {  // one payload per step; leaving the loop starts the next pass
+            int64_t t = -1;
+            if (get_packet_pts(d, &cursor, &t, target_type) != HOVA_OK) return kAsfNoPacket;
+            if (t != -1) {
+                if (single_probe) {
+                    prev = next = {curr, t};
+                    got_forward = got_backward = true;
+                    goto finish;
+                }
+                if (narrowing > 0) {
+                    if (t < target) {
+                        lower = curr;
+                        start_time = t;
+                    } else {
+                        upper = curr;
+                        stop_time = t;
+                    }
+                    --narrowing;
+                    break;
+                }
+                if (t < target) {
+                    got_backward = true;
+                    prev = {curr, t};
+                } else if (t == target) {
+                    prev = next = {curr, t};
+                    got_forward = true;
+                    goto finish;
+                } else {
+                    got_forward = true;
+                    next = {curr, t};
+                }
+                if (got_forward && got_backward) goto finish;
+            }
+            if (cursor.num_payloads > 0) continue;
+
+            if (backward) {
+                if (curr == 0) {
+                    prev = {0, 0};
+                    goto finish;
+                }
+                --curr;
+                (void)cb->cb_seek64(cb, -2 * static_cast<cb_off_t>(d->packet_size), CB_SEEK_CUR);
+            } else if (got_forward) {
+                // A later time and no earlier one yet: walk back from the start.
+                backward = true;
+                curr = init;
+                (void)cb->cb_seek64(cb, static_cast<cb_off_t>(asf_packet_position(d, curr)),
+                                    CB_SEEK_SET);
+            } else {
+                ++curr;
+            }
+            if (curr >= d->num_packets) {
+                if (dir == HOVA_SEEK_FORWARD ? !got_forward : !got_backward) return kAsfNoPacket;
+                goto finish;
+            }
+        }
+    }
+
+finish:
+    if (dir == HOVA_SEEK_FORWARD) {
+        if (!got_forward) return kAsfNoPacket;
+        *pts = next.pts;
+        return next.packet;
+    }
+    *pts = prev.pts;
+    return prev.packet;
+}

@@ -1,0 +1,193 @@
+// Seeks through the simple index: where the walk starts, the start offset,
+// the walks over repeated entries in both directions, and indexes that cannot
+// answer (the search without index takes over on local input).
+#include <gtest/gtest.h>
+
+#include "seek_fixture.h"
+#include "test_env.h"
+
+namespace {
+
+using seektest::Clip;
+using seektest::Player;
+
+// Every frame is a key frame (frame i at i x 100 ms in packet i), so the
+// index alone decides where a seek lands. Entries are 1 s apart.
+Clip every_frame_key(std::vector<uint32_t> entries) {
+    Clip c;
+    c.key_every = 1;
+    c.index_entries = std::move(entries);
+    return c;
+}
+
+const std::vector<uint32_t> kEntries = {0, 10, 20, 25, 28, 40, 40, 70, 80, 90};
+
+TEST(IndexSeek, WalksFromTheTargetsEntryToTheNextDistinctKeyFrame) {
+    struct Case {
+        int dir;
+        int64_t target;
+        int64_t found;
+    } cases[] = {
+        // Entry 2 (packet 20); entry 3's key frame (2.5 s) is after 2.2 s.
+        {HOVA_SEEK_BACKWARD, 2200000, 2000000},
+        {HOVA_SEEK_FORWARD, 2200000, 2500000},
+        // Entries 3 and 4 are at or before 2.9 s: backward takes one step on,
+        // forward keeps walking and lands on the first one after the target.
+        {HOVA_SEEK_BACKWARD, 2900000, 2500000},
+        {HOVA_SEEK_FORWARD, 2900000, 4000000},
+        // A key frame exactly at the target: forward passes it over.
+        {HOVA_SEEK_BACKWARD, 2000000, 2000000},
+        {HOVA_SEEK_FORWARD, 2000000, 2500000},
+        // Entry 5 repeats in entry 6: backward stays on it, forward goes to
+        // the entry after the repeats.
+        {HOVA_SEEK_BACKWARD, 5500000, 4000000},
+        {HOVA_SEEK_FORWARD, 5500000, 7000000},
+        // The last entry's interval: backward is answered by the index,
+        // forward by the search without index (an exact frame at 9.5 s).
+        {HOVA_SEEK_BACKWARD, 9500000, 9000000},
+        {HOVA_SEEK_FORWARD, 9500000, 9500000},
+        // Before entry 0's time the walk starts at entry 0.
+        {HOVA_SEEK_BACKWARD, -3000000, 0},
+    };
+    for (const Case& c : cases) {
+        SCOPED_TRACE(testing::Message() << "dir " << c.dir << " target " << c.target);
+        Player p(seektest::build(every_frame_key(kEntries)));
+        p.open_or_fail();
+        int64_t t = c.target;
+        ASSERT_EQ(seektest::seek(p, c.dir, &t), HOVA_OK);
+        EXPECT_EQ(t, c.found);
+        // Delivery resumes with the video frame found.
+        ASSERT_EQ(p.play(), HOVA_EndOfStream);
+        const auto v = seektest::media(p, HOVA_STREAM_VIDEO);
+        ASSERT_FALSE(v.empty());
+        EXPECT_EQ(v.front().pts, c.found);
+        p.expect_clean_close();
+    }
+}
+
+TEST(IndexSeek, StartOffsetIsWorkedOutOnceFromTheFirstEntryNamingAnotherPacket) {
+    // Entries 0 and 1 name packet 0; entry 2 names packet 10 (1 s): entry 0
+    // stands for -1 s, and 5.5 s falls in entry 6.
+    Clip c = every_frame_key({0, 0, 10, 20, 30, 40, 50, 60, 70, 80});
+    testenv::LogCapture log;
+    Player p(seektest::build(c));
+    p.open_or_fail();
+    for (int64_t target : {5500000, 3200000}) {
+        int64_t t = target;
+        ASSERT_EQ(seektest::seek(p, HOVA_SEEK_BACKWARD, &t), HOVA_OK);
+    }
+    EXPECT_EQ(p.ctx()->index_start_offset, -1000000);
+    int computed = 0;
+    for (const auto& l : log.lines())
+        if (l.text.find("[ASF] index_start_offset") == 0) {
+            ++computed;
+            EXPECT_EQ(l.text,
+                      "[ASF] index_start_offset -1000000, preroll 0, first non-zero pts 1000000, "
+                      "packet 10, index 2, interval 1000000\n");
+        }
+    EXPECT_EQ(computed, 1);
+    EXPECT_TRUE(log.contains("[ASF] enter asf_find_packet_by_index, index 6\n"));
+    EXPECT_TRUE(log.contains("[ASF] enter asf_find_packet_by_index, index 4\n"));
+    p.expect_clean_close();
+}
+
+TEST(IndexSeek, WalkStartsAtTheEntryOfTheTargetsInterval) {
+    Clip c;  // key frames every second, encoder-made index, offset 0
+    testenv::LogCapture log;
+    Player p(seektest::build(c));
+    p.open_or_fail();
+    int64_t t = 5500000;
+    ASSERT_EQ(seektest::seek(p, HOVA_SEEK_BACKWARD, &t), HOVA_OK);
+    EXPECT_EQ(t, 5000000);
+    EXPECT_EQ(p.ctx()->index_start_offset, 0);
+    EXPECT_TRUE(log.contains("[ASF] enter asf_find_packet_by_index, index 5\n"));
+    EXPECT_FALSE(log.contains("[ASF] seek without index, type 3\n"));
+    p.expect_clean_close();
+}
+
+TEST(IndexSeek, IndexThatCannotAnswerLeavesTheSeekToTheSearch) {
+    struct Case {
+        const char* what;
+        Clip clip;
+        bool index_answers;
+    };
+    std::vector<Case> cases;
+    {
+        Clip c;  // entries past the data
+        c.index_entries = std::vector<uint32_t>(10, 5000);
+        cases.push_back({"past the data", c, false});
+    }
+    {
+        Clip c;  // more entries declared than the file holds
+        c.index_declared_count = 1000;
+        c.cut_after_index_header = true;
+        cases.push_back({"beyond the end of the file", c, false});
+    }
+    {
+        Clip c;
+        c.index_interval_100ns = 0;
+        cases.push_back({"interval 0", c, false});
+    }
+    {
+        Clip c;  // every entry names packet 30: the index answers with it
+        c.index_entries = std::vector<uint32_t>(10, 30);
+        cases.push_back({"all one packet", c, true});
+    }
+    for (const Case& k : cases) {
+        for (int dir : {HOVA_SEEK_BACKWARD, HOVA_SEEK_FORWARD}) {
+            SCOPED_TRACE(testing::Message() << k.what << ", dir " << dir);
+            testenv::LogCapture log;
+            Player p(seektest::build(k.clip));
+            p.open_or_fail();
+            int64_t t = 4550000;
+            ASSERT_EQ(seektest::seek(p, dir, &t), HOVA_OK);
+            if (k.index_answers) {
+                EXPECT_EQ(t, 3000000);
+                EXPECT_EQ(p.ctx()->index_start_offset, 0);
+            } else {
+                EXPECT_EQ(t, dir == HOVA_SEEK_BACKWARD ? 4000000 : 5000000);
+                EXPECT_TRUE(log.contains("[ASF] seek without index, type 3\n"));
+            }
+            ASSERT_EQ(p.play(), HOVA_EndOfStream);
+            ASSERT_FALSE(seektest::media(p, HOVA_STREAM_VIDEO).empty());
+            EXPECT_EQ(seektest::media(p, HOVA_STREAM_VIDEO).front().pts, t);
+            p.expect_clean_close();
+        }
+    }
+}
+
+TEST(IndexSeek, NetworkInputSeeksVideoOnlyThroughAUsableIndex) {
+    host::InputOptions net;
+    net.streaming = true;
+    {
+        // No index: not seekable, refused before the input is touched.
+        Clip c;
+        c.index = false;
+        Player p(seektest::build(c), net);
+        p.open_or_fail();
+        const uint64_t reads = p.input().counters().reads, seeks = p.input().counters().seeks;
+        int64_t t = 2000000;
+        EXPECT_EQ(seektest::seek(p, HOVA_SEEK_BACKWARD, &t), HOVA_SeekFailed);
+        EXPECT_EQ(t, 2000000);
+        EXPECT_EQ(p.input().counters().reads, reads);
+        EXPECT_EQ(p.input().counters().seeks, seeks);
+        p.expect_clean_close();
+    }
+    {
+        // With an index, a target the index cannot answer fails: no search.
+        Clip c = every_frame_key(kEntries);
+        Player p(seektest::build(c), net);
+        p.open_or_fail();
+        testenv::LogCapture log;
+        int64_t t = 9500000;
+        EXPECT_EQ(seektest::seek(p, HOVA_SEEK_FORWARD, &t), HOVA_SeekFailed);
+        EXPECT_FALSE(log.contains("[ASF] seek without index, type 3\n"));
+        EXPECT_TRUE(log.contains("[ASF] seek fail\n"));
+        t = 2200000;
+        EXPECT_EQ(seektest::seek(p, HOVA_SEEK_BACKWARD, &t), HOVA_OK);
+        EXPECT_EQ(t, 2000000);
+        p.expect_clean_close();
+    }
+}
+
+}  // namespace

@@ -1,0 +1,165 @@
+// Seeks without an index: the interpolated first probe, the scan in both
+// directions, exact matches, the turn back to packet 0, and audio-only files
+// on local and network input.
+#include <gtest/gtest.h>
+
+#include "seek_fixture.h"
+#include "test_env.h"
+
+namespace {
+
+using seektest::Clip;
+using seektest::Player;
+
+Clip no_index() {
+    Clip c;
+    c.index = false;
+    return c;
+}
+
+// Raw input positions of the reads a seek makes (no reader buffering, so
+// each of the reader's reads is one input read at its own position).
+struct ReadLog {
+    std::vector<uint64_t> positions;
+    void attach(Player& p) {
+        p.input().faults().before_read = [this](uint64_t pos, size_t) { positions.push_back(pos); };
+    }
+};
+
+host::InputOptions unbuffered() {
+    host::InputOptions in;
+    in.disable_cache = true;
+    return in;
+}
+
+TEST(SearchWithoutIndex, FindsTheNearestObjectStartInTheAskedDirection) {
+    Clip late_key = no_index();
+    late_key.key_first = 5;  // key frames at 0.5 s, 1.5 s, ...
+    Clip audio_only = no_index();
+    audio_only.video = false;
+    struct Case {
+        const char* what;
+        Clip clip;
+        int dir;
+        int64_t target;
+        int rc;
+        int64_t found;
+    } cases[] = {
+        {"between key frames", no_index(), HOVA_SEEK_BACKWARD, 2350000, HOVA_OK, 2000000},
+        {"between key frames", no_index(), HOVA_SEEK_FORWARD, 2350000, HOVA_OK, 3000000},
+        {"exact", no_index(), HOVA_SEEK_BACKWARD, 3000000, HOVA_OK, 3000000},
+        {"exact", no_index(), HOVA_SEEK_FORWARD, 3000000, HOVA_OK, 3000000},
+        // The first probe starts after the last key frame (packet 90): every
+        // probe scans forward, so nothing is found in either direction.
+        {"past the end", no_index(), HOVA_SEEK_BACKWARD, 60000000, HOVA_SeekFailed, 60000000},
+        {"past the end", no_index(), HOVA_SEEK_FORWARD, 60000000, HOVA_SeekFailed, 60000000},
+        {"after the last key frame", no_index(), HOVA_SEEK_BACKWARD, 9200000, HOVA_SeekFailed,
+         9200000},
+        // Nothing at or before the target: the scan reaches packet 0, which
+        // is reported with time 0.
+        {"before the first key frame", late_key, HOVA_SEEK_BACKWARD, 200000, HOVA_OK, 0},
+        {"before the first key frame", late_key, HOVA_SEEK_FORWARD, 200000, HOVA_OK, 500000},
+        {"negative target", no_index(), HOVA_SEEK_FORWARD, -700000, HOVA_OK, 0},
+        // Audio: every object start counts.
+        {"audio", audio_only, HOVA_SEEK_BACKWARD, 2350000, HOVA_OK, 2300000},
+        {"audio", audio_only, HOVA_SEEK_FORWARD, 2350000, HOVA_OK, 2400000},
+    };
+    for (const Case& c : cases) {
+        SCOPED_TRACE(testing::Message() << c.what << ", dir " << c.dir);
+        Player p(seektest::build(c.clip));
+        p.open_or_fail();
+        int64_t t = c.target;
+        ASSERT_EQ(seektest::seek(p, c.dir, &t), c.rc);
+        EXPECT_EQ(t, c.found);
+        if (c.rc == HOVA_OK) {
+            ASSERT_EQ(p.play(), HOVA_EndOfStream);
+            const auto kind = c.clip.video ? HOVA_STREAM_VIDEO : HOVA_STREAM_AUDIO;
+            const auto f = seektest::media(p, kind);
+            ASSERT_FALSE(f.empty());
+            EXPECT_EQ(f.front().pts, c.found);
+        }
+        p.expect_clean_close();
+    }
+}
+
+TEST(SearchWithoutIndex, FirstProbeIsInterpolatedFromTheDuration) {
+    struct Case {
+        const char* what;
+        uint32_t packets;
+        std::optional<uint64_t> duration_100ns;
+        bool broadcast;
+        int64_t target;
+        uint64_t first_packet_read;
+    } cases[] = {
+        // 100 s over 1000 packets: 25 s lies at packet 250.
+        {"quarter", 1000, 1000000000, false, 25000000, 250},
+        {"beyond the duration", 1000, 1000000000, false, 500000000, 999},
+        // Without a duration the search starts at packet 0.
+        {"no duration", 200, {}, true, 5000000, 0},
+    };
+    for (const Case& c : cases) {
+        SCOPED_TRACE(c.what);
+        Clip clip = no_index();
+        clip.packets = c.packets;
+        clip.play_duration_100ns = c.duration_100ns;
+        clip.broadcast = c.broadcast;
+        Player p(seektest::build(clip), unbuffered());
+        p.open_or_fail();
+        ReadLog reads;
+        reads.attach(p);
+        int64_t t = c.target;
+        (void)seektest::seek(p, HOVA_SEEK_BACKWARD, &t);
+        ASSERT_FALSE(reads.positions.empty());
+        EXPECT_EQ(reads.positions.front(), p.ctx()->first_packet + uint64_t{1024} * c.first_packet_read);
+        p.expect_clean_close();
+    }
+}
+
+TEST(SearchWithoutIndex, TimeZeroGoesToPacketZeroWithoutProbing) {
+    for (bool index : {false, true}) {
+        SCOPED_TRACE(index ? "with index" : "without index");
+        Clip c;
+        c.index = index;
+        Player p(seektest::build(c), unbuffered());
+        p.open_or_fail();
+        for (int i = 0; i < 30; ++i) p.step();
+        testenv::LogCapture log;
+        ReadLog reads;
+        reads.attach(p);
+        int64_t t = 0;
+        ASSERT_EQ(seektest::seek(p, HOVA_SEEK_FORWARD, &t), HOVA_OK);
+        EXPECT_EQ(t, 0);
+        EXPECT_TRUE(reads.positions.empty());
+        EXPECT_FALSE(log.contains("[ASF] seek without index, type 3\n"));
+        EXPECT_EQ(p.ctx()->cur_packets, 0u);
+        p.host.events().clear();
+        ASSERT_EQ(p.play(), HOVA_EndOfStream);
+        EXPECT_EQ(seektest::media(p, HOVA_STREAM_VIDEO).front().pts, 0);
+        EXPECT_EQ(seektest::media(p, HOVA_STREAM_AUDIO).front().pts, 0);
+        p.expect_clean_close();
+    }
+}
+
+TEST(SearchWithoutIndex, NetworkAudioTakesTheFirstObjectAfterOneProbe) {
+    Clip c = no_index();
+    c.video = false;
+    host::InputOptions net;
+    net.streaming = true;
+    net.disable_cache = true;
+    for (int dir : {HOVA_SEEK_BACKWARD, HOVA_SEEK_FORWARD}) {
+        Player p(seektest::build(c), net);
+        p.open_or_fail();
+        ReadLog reads;
+        reads.attach(p);
+        // 2.35 s of 10 s over 100 packets: the probe starts at packet 23.
+        int64_t t = 2350000;
+        ASSERT_EQ(seektest::seek(p, dir, &t), HOVA_OK);
+        EXPECT_EQ(t, 2300000);
+        ASSERT_FALSE(reads.positions.empty());
+        EXPECT_EQ(reads.positions.front(), p.ctx()->first_packet + 23u * 1024u);
+        EXPECT_LE(reads.positions.back(), p.ctx()->first_packet + 24u * 1024u);
+        p.expect_clean_close();
+    }
+}
+
+}  // namespace
