@@ -8,6 +8,7 @@
 #include <cstring>
 
 #include "byte_reader.h"
+#include "streaming.h"
 #include "sys_output.h"
 
 namespace {
@@ -46,12 +47,15 @@ struct PeekSource {
     uint32_t pos = 0;
     bool incomplete = false;
     static constexpr bool kCanResync = false;
-    int32_t read(uint8_t* dst, int32_t n) {
+    [[gnu::always_inline]] int32_t read(uint8_t* dst, int32_t n) {
         if (size - pos < static_cast<uint32_t>(n)) {
             incomplete = true;
             return 0;
         }
-        std::memcpy(dst, data + pos, static_cast<size_t>(n));
+        if (n == 1)
+            *dst = data[pos];
+        else
+            std::memcpy(dst, data + pos, static_cast<size_t>(n));
         pos += static_cast<uint32_t>(n);
         return n;
     }
@@ -64,6 +68,21 @@ struct PeekSource {
         return true;
     }
 };
+
+// Fields straight from the peeked bytes, without a copy per field.
+[[gnu::always_inline]] inline uint32_t read_field(PeekSource& src, uint32_t* out, uint32_t type) {
+    *out = 0;
+    const uint32_t width = field_width(type);
+    if (width == 0) return 0;
+    if (src.size - src.pos < width) {
+        src.incomplete = true;
+        return 0;
+    }
+    const uint8_t* b = src.data + src.pos;
+    *out = width == 1 ? b[0] : width == 2 ? plimo::load_le<uint16_t>(b) : plimo::load_le<uint32_t>(b);
+    src.pos += width;
+    return width;
+}
 
 template <typename Source>
 uint32_t read_field(Source& src, uint32_t* out, uint32_t type) {
@@ -170,6 +189,21 @@ int parse_payload_header(Source& src, asf_packet_st* p, uint32_t* parsed, int* a
 // hold the whole header and the caller must parse from the reader instead.
 template <typename Parse>
 int try_from_peek(cb_buffer_st* cb, int32_t window, Parse parse) {
+    // With the file cache the bytes ahead usually are in memory already:
+    // parse them where they are.
+    if (cb->buffer_type == CB_FS_CACHE && cb->cb_peek == cb_peek_single) {
+        const fs_cache_st& c = cb->fs_cache;
+        if (cb->curpos >= c.base_pos && cb->curpos < c.base_pos + c.avail_size) {
+            const uint32_t off = static_cast<uint32_t>(cb->curpos - c.base_pos);
+            PeekSource src{c.buffer + off, c.avail_size - off};
+            const int r = parse(src);
+            if (!src.incomplete) {
+                if (cb->cb_seek64(cb, static_cast<cb_off_t>(src.pos), CB_SEEK_CUR) == -1)
+                    return HOVA_EndOfStream;
+                return r;
+            }
+        }
+    }
     uint8_t buf[kPacketHeaderPeek > kPayloadHeaderPeek ? kPacketHeaderPeek : kPayloadHeaderPeek];
     const int32_t got = cb->cb_peek(cb, buf, window);
     if (got != window) return -1;
@@ -190,10 +224,11 @@ int read_1_2_4_bytes(cb_buffer_st* cb, uint32_t* out, uint32_t type) {
 
 int read_packet_header(asf_demuxer_st* d, asf_packet_st* p, uint32_t* header_size) {
     cb_buffer_st* cb = &d->s.cbuffer;
-    // The peeked parse writes into a copy so that a fallback starts clean.
-    asf_packet_st tmp = *p;
+    // Peeked parses write into a copy so that a fallback starts clean.
+    asf_packet_st tmp;
     uint32_t size = 0;
     const int r = try_from_peek(cb, kPacketHeaderPeek, [&](PeekSource& src) {
+        tmp = *p;
         return parse_packet_header(d, src, &tmp, &size);
     });
     if (r >= 0) {
@@ -208,10 +243,13 @@ int read_packet_header(asf_demuxer_st* d, asf_packet_st* p, uint32_t* header_siz
 int asf_read_payload_header_ex(asf_demuxer_st* d, asf_packet_st* p, uint32_t* parsed,
                                int* announced_size) {
     cb_buffer_st* cb = &d->s.cbuffer;
-    asf_packet_st tmp = *p;
-    uint32_t tmp_parsed = *parsed;
+    asf_packet_st tmp;
+    uint32_t tmp_parsed = 0;
     int tmp_announced = 0;
     const int r = try_from_peek(cb, kPayloadHeaderPeek, [&](PeekSource& src) {
+        // Each attempt starts from the caller's record.
+        tmp = *p;
+        tmp_parsed = *parsed;
         return parse_payload_header(src, &tmp, &tmp_parsed, &tmp_announced);
     });
     if (r >= 0) {
