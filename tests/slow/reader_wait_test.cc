@@ -33,7 +33,8 @@ TEST(RingWait, ProducerGivesUpWhenNobodyReleases) {
 
 TEST(ReaderWait, RingWithoutThreadTimesOutOnAnEmptyRing) {
     Reader r(pattern(1000), options_for(Mode::SyncRing, 64, 256));
-    ASSERT_EQ(r.open(), 0);  // multi-thread set, nothing fills the ring
+    ASSERT_EQ(r.open(), 0);
+    changeThreadType(&r.cb_, 1);  // the multi-thread set, and no thread to fill the ring
     const auto t0 = Clock::now();
     uint8_t b[10];
     EXPECT_EQ(r.read(b, 10), 0);
@@ -47,6 +48,7 @@ TEST(ReaderWait, RingWithoutThreadTimesOutOnAnEmptyRing) {
 TEST(ReaderWait, SeekInARingWithoutThreadStopsWaitingAndMovesTheInput) {
     Reader r(pattern(1000), options_for(Mode::SyncRing, 64, 256));
     ASSERT_EQ(r.open(), 0);
+    changeThreadType(&r.cb_, 1);
     const auto t0 = Clock::now();
     EXPECT_EQ(r.seek(500, CB_SEEK_SET), 500);
     EXPECT_GE(seconds_since(t0), 8.9);

@@ -86,7 +86,12 @@ int OpenURL(cb_buffer_st* cbuf, cb_io_st* input, int ringbuf_size, const hova_ca
     cbuf->cb_errcode = CB_ERR_OK;
     cbuf->curpos = 0;
 
-    if (!input->use_thread) return 0;
+    if (!input->use_thread) {
+        // Nothing but a streaming thread fills the ring for the multi-thread
+        // set; without one the reader tops the ring up itself.
+        if (cbuf->active_rbuf) changeThreadType(cbuf, 0);
+        return 0;
+    }
     // Only a ring can carry data from a thread to the reader.
     if (!cbuf->active_rbuf) {
         SYS_LOG("reader: thread asked for without a ring, reading on the caller's thread\n");
