@@ -161,7 +161,8 @@ Bytes misaligned_packet(const Bytes& junk, const std::vector<Payload>& payloads,
 }
 
 std::vector<Bytes> mux(const std::vector<Object>& objects, uint32_t packet_size,
-                       const PacketLayout& layout, uint8_t first_object_num) {
+                       const PacketLayout& layout, uint8_t first_object_num, uint32_t fill) {
+    const uint32_t limit = fill ? std::min(fill, packet_size) : packet_size;
     std::vector<Bytes> packets;
     std::map<uint8_t, uint32_t> next_num;
     std::vector<Payload> current;
@@ -181,11 +182,11 @@ std::vector<Bytes> mux(const std::vector<Object>& objects, uint32_t packet_size,
         do {
             Payload probe = media(o.stream, num, offset, size, o.pts_ms, {}, o.key);
             const uint32_t head = payload_header_size(l, probe);
-            if (used + head >= packet_size || (!l.multiple && !current.empty())) {
+            if (used + head >= limit || (!l.multiple && !current.empty())) {
                 flush();
                 continue;
             }
-            const uint32_t room = packet_size - used - head;
+            const uint32_t room = limit - used - head;
             const uint32_t take = std::min(room, size - offset);
             probe.data.assign(o.data.begin() + offset, o.data.begin() + offset + take);
             current.push_back(std::move(probe));

@@ -94,8 +94,11 @@ struct Object {
 // Packs objects in the order given into packets of `packet_size`, splitting
 // each into fragments as room allows; object numbers count per stream from
 // `first_object_num`.
+// `fill` (0: the packet size) caps the bytes used in each packet, leaving the
+// rest as padding.
 std::vector<Bytes> mux(const std::vector<Object>& objects, uint32_t packet_size,
-                       const PacketLayout& layout = {}, uint8_t first_object_num = 1);
+                       const PacketLayout& layout = {}, uint8_t first_object_num = 1,
+                       uint32_t fill = 0);
 
 // Scrambles an audio object the way a spread-audio encoder stores it (the
 // inverse of the demuxer's reordering).
