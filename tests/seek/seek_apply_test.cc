@@ -28,10 +28,8 @@ std::vector<Frame> frames_of(const Player& p) {
 host::InputOptions buffering(int m) {
     host::InputOptions in;
     if (m == 1) in.disable_cache = true;
-    if (m == 3) {
-        in.rbuf_mode = CBIO_APPLY_RBUF;
-        in.use_thread = true;
-    }
+    if (m >= 2) in.rbuf_mode = CBIO_APPLY_RBUF;
+    if (m == 3) in.use_thread = true;
     return in;
 }
 
@@ -39,6 +37,8 @@ TEST(SeekEffect, QueryOrFailedSeekLeavesDeliveryWhereItWas) {
     Clip indexed;
     Clip plain;
     plain.index = false;
+    Clip cut;
+    cut.cut_in_packet = 60;
     struct Case {
         const char* what;
         Clip clip;
@@ -52,9 +52,10 @@ TEST(SeekEffect, QueryOrFailedSeekLeavesDeliveryWhereItWas) {
         {"query by search", plain, HOVA_SEEK_FORWARD, 5500000, 1, HOVA_OK, 6000000},
         {"failed search", plain, HOVA_SEEK_FORWARD, 9500000, 0, HOVA_SeekFailed, 9500000},
         {"unknown direction", indexed, 2, 5500000, 0, HOVA_SeekFailed, 5500000},
+        {"target in the missing data", cut, HOVA_SEEK_BACKWARD, 7500000, 0, HOVA_SeekFailed, 7500000},
     };
     for (const Case& c : cases) {
-        for (int m : {0, 1, 3}) {
+        for (int m = 0; m < 4; ++m) {
             SCOPED_TRACE(testing::Message() << c.what << ", buffering " << m);
             Player ref(seektest::build(c.clip), buffering(m));
             ref.open_or_fail();

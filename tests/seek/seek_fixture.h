@@ -39,6 +39,7 @@ struct Clip {
     std::optional<uint64_t> index_interval_100ns;          // written as is
     std::optional<uint32_t> index_declared_count;
     bool cut_after_index_header = false;                   // the file ends in the index
+    std::optional<uint32_t> cut_in_packet;                 // the file ends halfway into it
 };
 
 inline bool is_key(const Clip& c, uint32_t i) {
@@ -119,6 +120,13 @@ inline Bytes build(const Clip& c) {
         }
         if (c.cut_after_index_header) idx.resize(56 + 6 * 2);
         f.trailing.push_back(idx);
+    }
+    if (c.cut_in_packet) {
+        f.trailing.clear();
+        Bytes all = asfb::build(f);
+        const size_t first = all.size() - size_t{c.packets} * c.packet_size;
+        all.resize(first + size_t{*c.cut_in_packet} * c.packet_size + c.packet_size / 2);
+        return all;
     }
     return asfb::build(f);
 }

@@ -1,0 +1,17 @@
+// Inputs shared by the benchmarks: the cache directory outside the source
+// tree and the large WMV made there once with ffmpeg.
+#pragma once
+
+#include <string>
+
+namespace plimo_bench {
+
+// $XDG_CACHE_HOME/plimo-bench, else ~/.cache/plimo-bench, else /tmp/plimo-bench.
+std::string default_cache_dir();
+
+// CACHE/big.wmv: 60 s of 1280x720 WMV2 at 30 Mbit/s with key frames every
+// 2 s and WMA2 audio, made with ffmpeg the first time; "" when it cannot be
+// made (ffmpeg missing).
+std::string big_file(const std::string& cache);
+
+}  // namespace plimo_bench
