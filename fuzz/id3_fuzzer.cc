@@ -15,7 +15,8 @@
 namespace {
 
 // bit 0: seekable; bits 1-2: buffering (cache, none, small cache, ring);
-// bit 3: size unknown; bits 4-5: which host allocation of the parse fails.
+// bit 3: size unknown; bits 4-5: which host allocation of the parse fails;
+// bit 6: with the ring, a streaming thread fills it.
 host::InputOptions options_for(uint8_t opt) {
     host::InputOptions o;
     o.seekable = opt & 1;
@@ -24,10 +25,9 @@ host::InputOptions options_for(uint8_t opt) {
         case 1: o.disable_cache = true; break;
         case 2: o.block_size = 64; break;
         default:
-            // The ring is filled by the streaming thread; without it the
-            // multi-thread reads only time out.
+            // Ring filled by the streaming thread or, without one, synchronously.
             o.rbuf_mode = CBIO_APPLY_RBUF;
-            o.use_thread = true;
+            o.use_thread = (opt & 0x40) != 0;
             o.block_size = 512;
             o.ring_size = 4096;
             break;
