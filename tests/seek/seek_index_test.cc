@@ -51,11 +51,16 @@ TEST(IndexSeek, WalksFromTheTargetsEntryToTheNextDistinctKeyFrame) {
     };
     for (const Case& c : cases) {
         SCOPED_TRACE(testing::Message() << "dir " << c.dir << " target " << c.target);
+        testenv::LogCapture log;
         Player p(seektest::build(every_frame_key(kEntries)));
         p.open_or_fail();
         int64_t t = c.target;
         ASSERT_EQ(seektest::seek(p, c.dir, &t), HOVA_OK);
         EXPECT_EQ(t, c.found);
+        // Entry 0 stands for time 0 here: the walk starts at the target's second.
+        if (c.target == 5500000) {
+            EXPECT_TRUE(log.contains("[ASF] enter asf_find_packet_by_index, index 5\n"));
+        }
         // Delivery resumes with the video frame found.
         ASSERT_EQ(p.play(), HOVA_EndOfStream);
         const auto v = seektest::media(p, HOVA_STREAM_VIDEO);
@@ -88,20 +93,6 @@ TEST(IndexSeek, StartOffsetIsWorkedOutOnceFromTheFirstEntryNamingAnotherPacket) 
     EXPECT_EQ(computed, 1);
     EXPECT_TRUE(log.contains("[ASF] enter asf_find_packet_by_index, index 6\n"));
     EXPECT_TRUE(log.contains("[ASF] enter asf_find_packet_by_index, index 4\n"));
-    p.expect_clean_close();
-}
-
-TEST(IndexSeek, WalkStartsAtTheEntryOfTheTargetsInterval) {
-    Clip c;  // key frames every second, encoder-made index, offset 0
-    testenv::LogCapture log;
-    Player p(seektest::build(c));
-    p.open_or_fail();
-    int64_t t = 5500000;
-    ASSERT_EQ(seektest::seek(p, HOVA_SEEK_BACKWARD, &t), HOVA_OK);
-    EXPECT_EQ(t, 5000000);
-    EXPECT_EQ(p.ctx()->index_start_offset, 0);
-    EXPECT_TRUE(log.contains("[ASF] enter asf_find_packet_by_index, index 5\n"));
-    EXPECT_FALSE(log.contains("[ASF] seek without index, type 3\n"));
     p.expect_clean_close();
 }
 

@@ -74,29 +74,3 @@ TEST(TimestampProbe, GivesTimesOnlyForObjectStartsOfTheWantedKind) {
 }
 
 }  // namespace
-
-namespace {
-
-TEST(TimestampProbe, KeyFrameProbeWalksToTheNextKeyFrameInsideTheData) {
-    seektest::Clip c;
-    c.packets = 30;
-    c.key_first = 5;
-    Player p(seektest::build(c));
-    p.open_or_fail();
-    asf_demuxer_st* d = p.ctx();
-    struct {
-        uint32_t packet;
-        int64_t expected;
-    } cases[] = {
-        {0, 500000},    // passes packets without a key frame
-        {5, 500000},
-        {6, 1500000},
-        {26, -1},       // no key frame before the end of the data
-        {30, -1},       // first packet past the data (the index lies there)
-        {0xFFFFFFFFu, -1},
-    };
-    for (const auto& k : cases) EXPECT_EQ(get_packet_pts_with_number(d, k.packet), k.expected) << k.packet;
-    p.expect_clean_close();
-}
-
-}  // namespace
