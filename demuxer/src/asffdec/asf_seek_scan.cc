@@ -18,19 +18,25 @@ struct Candidate {
 };
 
 // Packet at which the target lies if time grows evenly over [lower, upper).
-// The quotient is kept whole (128-bit product) and the target held inside the
-// range, so a far or early target lands on the range's edge, never on a
-// wrapped-around packet.
+// The quotient is kept whole and the target held inside the range, so a far
+// or early target lands on the range's edge, never on a wrapped-around
+// packet. Only absurd sizes overflow the exact 64-bit product; they are
+// worked out in floating point, which is exact enough to pick a start.
 uint64_t interpolate(int64_t target, uint64_t lower, uint64_t upper, int64_t start_time,
                      int64_t stop_time, uint64_t num_packets) {
     uint64_t q = 0;
     if (target > start_time) {
-        const auto span = static_cast<unsigned __int128>(static_cast<uint64_t>(stop_time) -
-                                                         static_cast<uint64_t>(start_time));
-        const auto along = static_cast<unsigned __int128>(static_cast<uint64_t>(target) -
-                                                          static_cast<uint64_t>(start_time));
-        const unsigned __int128 v = along * (upper - lower) / span;
-        q = v > UINT64_MAX - lower ? UINT64_MAX - lower : static_cast<uint64_t>(v);
+        const uint64_t span = static_cast<uint64_t>(stop_time) - static_cast<uint64_t>(start_time);
+        const uint64_t along = static_cast<uint64_t>(target) - static_cast<uint64_t>(start_time);
+        const uint64_t range = upper - lower;
+        uint64_t product = 0;
+        if (!__builtin_mul_overflow(along, range, &product)) {
+            q = product / span;
+        } else {
+            const long double v = static_cast<long double>(along) * range / span;
+            q = v >= static_cast<long double>(UINT64_MAX) ? UINT64_MAX : static_cast<uint64_t>(v);
+        }
+        if (q > UINT64_MAX - lower) q = UINT64_MAX - lower;
     }
     const uint64_t packet = lower + q;
     return packet < num_packets - 1 ? packet : num_packets - 1;
