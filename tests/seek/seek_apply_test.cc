@@ -3,6 +3,8 @@
 // sequential and in separate parsing, also after the end of the stream.
 #include <gtest/gtest.h>
 
+#include <random>
+
 #include "seek_fixture.h"
 #include "test_env.h"
 
@@ -204,6 +206,42 @@ TEST(SeekEffect, SeparateParsingFallsBackToSequentialWhenAudioIsNotFound) {
     ASSERT_EQ(p.play(), HOVA_EndOfStream);
     EXPECT_EQ(seektest::media(p, HOVA_STREAM_VIDEO).front().pts, 8000000);
     p.expect_clean_close();
+}
+
+}  // namespace
+
+namespace {
+
+// Damaged packets and index entries: seeks fail or land somewhere, but never
+// crash, hang, leak or leave a partial object pending at the host.
+TEST(SeekEffect, DamagedFilesNeverLeaveAnythingBehind) {
+    Clip c;
+    c.packet_size = 512;
+    c.packets = 60;
+    const asfb::Bytes clean = seektest::build(c);
+    std::mt19937 rng(7);
+    for (int round = 0; round < 150; ++round) {
+        asfb::Bytes file = clean;
+        // Damage in the data and the index (the last packets' worth of bytes).
+        const size_t from = file.size() - size_t{c.packets} * c.packet_size - 200;
+        for (int k = 0; k < 1 + round % 12; ++k)
+            file[from + rng() % (file.size() - from)] = static_cast<uint8_t>(rng());
+        SCOPED_TRACE(round);
+        Player p(file);
+        if (p.open() != HOVA_OK) continue;
+        for (int64_t target : {int64_t{1700000}, int64_t{3300000}, int64_t{-500000}, int64_t{90000000}}) {
+            for (int dir : {HOVA_SEEK_BACKWARD, HOVA_SEEK_FORWARD}) {
+                int64_t t = target;
+                const int rc = seektest::seek(p, dir, &t, static_cast<int>(rng() % 2));
+                ASSERT_TRUE(rc == HOVA_OK || rc == HOVA_SeekFailed);
+                for (int i = 0; i < 40; ++i) {
+                    const int r = p.step();
+                    if (r != HOVA_OK && r != HOVA_TryAgain) break;
+                }
+            }
+        }
+        p.expect_clean_close();
+    }
 }
 
 }  // namespace
