@@ -6,6 +6,7 @@
 #include "asf_packet.h"
 #include "asf_spread.h"
 #include "dprintf.h"
+#include "streaming.h"
 #include "sys_output.h"
 
 namespace {
@@ -68,6 +69,22 @@ void complete_object(asf_demuxer_st* d, asf_stream_st* s, hova_stream_type_et ty
     }
     s->buffer = nullptr;
     reset_object_size(s);
+}
+
+// A sub-payload's length byte. With the file cache holding it, it is taken in
+// place, as the cached read would (copy, then advance the position), without
+// a call per byte.
+int32_t read_length_byte(cb_buffer_st* cb, uint8_t* out) {
+    if (cb->buffer_type == CB_FS_CACHE && cb->cb_read == cb_read_single) {
+        const fs_cache_st& c = cb->fs_cache;
+        if (cb->curpos >= c.base_pos && cb->curpos < c.base_pos + c.avail_size) {
+            *out = c.buffer[cb->curpos - c.base_pos];
+            cb->curpos++;
+            cb->cb_errcode = CB_ERR_OK;
+            return 1;
+        }
+    }
+    return cb->cb_read(cb, out, 1);
 }
 
 // Gives the pending frame back after the host refused to grow it, so that a
@@ -209,7 +226,7 @@ extern "C" int asf_deliver_frame(void* ctx, hova_stream_type_et* type, int*, int
             if (p->compressed_payload) {
                 if (p->payload_len == 0) break;
                 uint8_t sub_len = 0;
-                (void)cb->cb_read(cb, &sub_len, 1);
+                (void)read_length_byte(cb, &sub_len);
                 len = sub_len;
                 p->payload_len--;
                 p->parsed_size++;
