@@ -6,6 +6,7 @@
 // av_read_frame loop over a custom AVIOContext) and a memcpy of the file.
 //
 // usage: demux_bench [--corpus DIR] [--cache DIR] [--big FILE] [--min-time S]
+//                    [--only LABEL] [--block-size N]
 // The large file is made once into the cache directory
 // ($XDG_CACHE_HOME/plimo-bench or ~/.cache/plimo-bench).
 #include <sys/stat.h>
@@ -42,7 +43,8 @@ using Clock = std::chrono::steady_clock;
 using Bytes = std::vector<uint8_t>;
 
 double g_min_time = 0.5;
-std::string g_only;  // run only the plug-in rows whose label contains this (profiling)
+std::string g_only;
+int g_block_size = 32768;  // the raw input's block_size (cache block)  // run only the plug-in rows whose label contains this (profiling)
 
 struct Result {
     double seconds = 0;  // per run
@@ -139,6 +141,7 @@ Result play_plugin(const Bytes& file, bool cache, Host& host, const hova_callbac
                    uint64_t* commits) {
     host::InputOptions in;
     in.disable_cache = !cache;
+    in.block_size = g_block_size;
     auto input = host::RawInput::borrow_memory(file.data(), file.size(), in);
     host::ContextBuffer buf(static_cast<size_t>(hova_asff_demuxer.min_context_size));
     void* ctx = nullptr;
@@ -352,8 +355,9 @@ int main(int argc, char** argv) {
         else if (a == "--big") big = argv[i + 1];
         else if (a == "--min-time") g_min_time = std::atof(argv[i + 1]);
         else if (a == "--only") g_only = argv[i + 1];
+        else if (a == "--block-size") g_block_size = std::atoi(argv[i + 1]);
         else {
-            std::fprintf(stderr, "usage: %s [--corpus DIR] [--cache DIR] [--big FILE] [--min-time S] [--only LABEL]\n", argv[0]);
+            std::fprintf(stderr, "usage: %s [--corpus DIR] [--cache DIR] [--big FILE] [--min-time S] [--only LABEL] [--block-size N]\n", argv[0]);
             return 2;
         }
     }
