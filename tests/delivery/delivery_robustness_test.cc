@@ -83,8 +83,7 @@ TEST(Robustness, ARealFileCutAnywhereInItsDataEnds) {
     }
 }
 
-TEST(Robustness, ARefusedFrameCostsAtMostItsObject) {
-    const Bytes file = sample_file();
+void sweep_refusals(const Bytes& file) {
     Player base(file);
     base.open_or_fail();
     const Outcome whole = play_to_end(base);
@@ -94,6 +93,7 @@ TEST(Robustness, ARefusedFrameCostsAtMostItsObject) {
         for (const auto& e : base.frames(t)) known.insert({e.pts, e.crc32});
     base.expect_clean_close();
     ASSERT_GT(allocs, 20u);
+    ASSERT_EQ(whole.last, HOVA_EndOfStream);
 
     for (uint64_t n = 1; n <= allocs; ++n) {
         SCOPED_TRACE(n);
@@ -107,6 +107,17 @@ TEST(Robustness, ARefusedFrameCostsAtMostItsObject) {
         for (auto t : {HOVA_STREAM_AUDIO, HOVA_STREAM_VIDEO})
             for (const auto& e : pl.frames(t)) EXPECT_TRUE(known.count({e.pts, e.crc32}));
         pl.expect_clean_close();
+    }
+}
+
+TEST(Robustness, ARefusedFrameCostsAtMostItsObject) { sweep_refusals(sample_file()); }
+
+TEST(Robustness, ARefusedFrameOfARealFileCostsAtMostItsObject) {
+    for (const char* name : {"moon-timecode-short.wmv", "musicmeta-elephant.asf"}) {
+        const std::string path = testenv::corpus_file(name);
+        if (path.empty()) GTEST_SKIP() << name << " not in " << testenv::corpus_dir();
+        SCOPED_TRACE(name);
+        sweep_refusals(testenv::read_file_or_empty(path));
     }
 }
 
