@@ -16,7 +16,6 @@
 #include "callbacks.h"
 #include "loader.h"
 #include "raw_input.h"
-#include "streaming.h"
 #include "test_env.h"
 
 namespace {
@@ -34,26 +33,9 @@ struct Played {
     std::map<int, std::vector<uint8_t>> bytes;  // concatenated frames per type
 };
 
-// The synchronous ring: a ring-buffered reader whose operations run on the
-// demuxer thread. Open installs the thread's operations for a ring; a host
-// that fills the ring itself swaps them before the first read, which this
-// harness does from the reader's first allocation during open.
-cb_buffer_st* g_sync_reader = nullptr;
-void* (*g_host_malloc)(void*, size_t) = nullptr;
-void* sync_ring_malloc(void* ctx, size_t size) {
-    if (g_sync_reader && g_sync_reader->cb_read == cb_read_multi) changeThreadType(g_sync_reader, 0);
-    return g_host_malloc(ctx, size);
-}
-
-Played play(const std::vector<uint8_t>& file, const host::InputOptions& in, bool keep_bytes = false,
-            bool sync_ring = false) {
+Played play(const std::vector<uint8_t>& file, const host::InputOptions& in, bool keep_bytes = false) {
     Played out;
     host::HostCallbacks cb;
-    hova_callback_st table = *cb.table();
-    if (sync_ring) {
-        g_host_malloc = table.malloc;
-        table.malloc = sync_ring_malloc;
-    }
     if (keep_bytes)
         cb.on_commit = [&](const HostEvent& e, const uint8_t* b) {
             if (e.packet_type == 0) out.bytes[e.type].insert(out.bytes[e.type].end(), b, b + e.size);
@@ -62,13 +44,8 @@ Played play(const std::vector<uint8_t>& file, const host::InputOptions& in, bool
         auto input = host::RawInput::borrow_memory(file.data(), file.size(), in);
         host::ContextBuffer buf(static_cast<size_t>(hova_asff_demuxer.min_context_size));
         void* ctx = nullptr;
-        // The context starts at the buffer's first 8-byte boundary.
-        auto at = reinterpret_cast<uintptr_t>(buf.data());
-        at = (at + 7) & ~static_cast<uintptr_t>(7);
-        g_sync_reader = sync_ring ? &reinterpret_cast<asf_demuxer_st*>(at)->s.cbuffer : nullptr;
         out.open_rc = hova_asff_demuxer.open_file(&ctx, input->io(), buf.data(), buf.size(), 1 << 20,
-                                                  &table);
-        g_sync_reader = nullptr;
+                                                  cb.table());
         if (out.open_rc == HOVA_OK) {
             for (;;) {
                 cb.call = ++out.calls;
@@ -192,7 +169,7 @@ TEST_P(CorpusDelivery, FramesMatchTheReferenceInEveryBufferingMode) {
     EXPECT_EQ(base.protocol_errors, 0u);
     for (int m = 1; m < 4; ++m) {
         SCOPED_TRACE(kModeNames[m]);
-        const Played other = play(file, mode(m), false, m == 2);
+        const Played other = play(file, mode(m));
         std::string why;
         EXPECT_TRUE(same_events(base, other, &why)) << kModeNames[m] << ": " << why;
         EXPECT_EQ(other.blocks_after_close, 0u);

@@ -117,7 +117,7 @@ TEST(AsfdumpFrames, PlayOptionsReachThePlugIn) {
             if (j["event"] == event && (!type || j["type"] == type)) ++n;
         return n;
     };
-    for (const char* mode : {"", "--buffer none", "--buffer ring --thread"}) {
+    for (const char* mode : {"", "--buffer none", "--buffer ring", "--buffer ring --thread"}) {
         SCOPED_TRACE(mode);
         const Dump d = run(file + " " + mode);
         ASSERT_EQ(d.status, 0);
