@@ -1,8 +1,9 @@
-// Packet and payload headers. Every header is first parsed from one peek of
-// the bytes ahead (one reader call instead of one per field); when the peek
-// cannot cover the header (end of input, short reads, long replicated data,
-// a packet start that needs the resync scan) the same parser runs again
-// field by field on the reader itself, so both paths give the same result.
+// Packet and payload headers. Every header is first parsed from the bytes
+// ahead held in memory: in place in the file cache when it holds them, else
+// from one peek (one reader call instead of one per field). When neither
+// covers the header (end of input, short reads, long replicated data, a
+// packet start that needs the resync scan) the same parser runs again field
+// by field on the reader itself, so every path gives the same result.
 #include "asf_packet.h"
 
 #include <cstring>
