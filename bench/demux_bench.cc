@@ -27,7 +27,9 @@
 #include <vector>
 
 #include "asf_api.h"
+#include "bench_files.h"
 #include "callbacks.h"
+#include "lean_host.h"
 #include "loader.h"
 #include "raw_input.h"
 
@@ -75,66 +77,7 @@ Result measure(const std::function<Result()>& run) {
 
 // ---- the plug-in ----
 
-// A host that only hands out frame buffers: one growing block per stream
-// type, no record of the frames.
-class LeanHost {
-public:
-    LeanHost() {
-        table_.notify = [](void*, hova_stream_type_et, hova_event_et) { return 0; };
-        table_.malloc = [](void* c, size_t n) { return self(c)->alloc(n); };
-        table_.realloc = [](void*, void*, size_t) -> void* { return nullptr; };
-        table_.freep = [](void* c, void* pp) { self(c)->release(pp); };
-        table_.get_time = [](void*) -> int64_t { return 0; };
-        table_.stream_alloc = [](void* c, hova_stream_type_et t, void** b, int n) {
-            return self(c)->frame(t, b, n);
-        };
-        table_.stream_realloc = [](void* c, hova_stream_type_et t, void** b, int n) {
-            return self(c)->frame(t, b, n);
-        };
-        table_.stream_discard = [](void*, hova_stream_type_et) { return 0; };
-        table_.stream_commit = [](void* c, hova_stream_type_et, int, int64_t, int64_t, int) {
-            self(c)->commits++;
-            return 0;
-        };
-        table_.stream_check_rbuf_size = [](void*, hova_stream_type_et) { return 0; };
-        table_.context = this;
-    }
-    ~LeanHost() {
-        for (auto& f : frames_) std::free(f.base);
-    }
-    const hova_callback_st* table() const { return &table_; }
-    uint64_t commits = 0;
-    int blocks = 0;
-
-private:
-    static LeanHost* self(void* c) { return static_cast<LeanHost*>(c); }
-    void* alloc(size_t n) {
-        blocks++;
-        return std::malloc(n ? n : 1);
-    }
-    void release(void* pp) {
-        void** p = static_cast<void**>(pp);
-        if (*p) blocks--;
-        std::free(*p);
-        *p = nullptr;
-    }
-    int frame(hova_stream_type_et t, void** b, int n) {
-        Frame& f = frames_[t & 15];
-        if (static_cast<size_t>(n) > f.cap) {
-            const size_t cap = std::max<size_t>(static_cast<size_t>(n), f.cap * 2 + 65536);
-            f.base = static_cast<uint8_t*>(std::realloc(f.base, cap));
-            f.cap = cap;
-        }
-        *b = f.base;
-        return 0;
-    }
-    struct Frame {
-        uint8_t* base = nullptr;
-        size_t cap = 0;
-    };
-    Frame frames_[16];
-    hova_callback_st table_{};
-};
+using plimo_bench::LeanHost;
 
 template <typename Host>
 Result play_plugin(const Bytes& file, bool cache, Host& host, const hova_callback_st* table,
@@ -274,28 +217,6 @@ std::vector<std::string> corpus_files(const std::string& dir) {
     return out;
 }
 
-std::string default_cache_dir() {
-    if (const char* x = std::getenv("XDG_CACHE_HOME")) return std::string(x) + "/plimo-bench";
-    if (const char* h = std::getenv("HOME")) return std::string(h) + "/.cache/plimo-bench";
-    return "/tmp/plimo-bench";
-}
-
-// The large file is made with ffmpeg the first time and kept in the cache.
-std::string big_file(const std::string& cache) {
-    const std::string path = cache + "/big.wmv";
-    struct stat st;
-    if (stat(path.c_str(), &st) == 0 && st.st_size > 0) return path;
-    std::string mk = "mkdir -p '" + cache + "'";
-    if (std::system(mk.c_str()) != 0) return "";
-    const std::string cmd =
-        "ffmpeg -v error -y -f lavfi -i testsrc2=size=1280x720:rate=25 -f lavfi -i sine=sample_rate=48000 "
-        "-t 60 -c:v wmv2 -b:v 30M -g 50 -c:a wmav2 '" + path + ".tmp.wmv' && mv '" + path + ".tmp.wmv' '" +
-        path + "'";
-    std::fprintf(stderr, "making %s with ffmpeg...\n", path.c_str());
-    if (std::system(cmd.c_str()) != 0) return "";
-    return path;
-}
-
 std::string base_name(const std::string& p) { return p.substr(p.find_last_of('/') + 1); }
 
 void report(const std::string& name, size_t size) {
@@ -346,7 +267,7 @@ void report(const std::string& name, size_t size) {
 }  // namespace
 
 int main(int argc, char** argv) {
-    std::string corpus, cache = default_cache_dir(), big;
+    std::string corpus, cache = plimo_bench::default_cache_dir(), big;
     if (const char* c = std::getenv("ASF_CORPUS")) corpus = c;
     for (int i = 1; i + 1 < argc; i += 2) {
         const std::string a = argv[i];
@@ -368,7 +289,7 @@ int main(int argc, char** argv) {
         stat(f.c_str(), &st);
         report(f, static_cast<size_t>(st.st_size));
     }
-    if (big.empty()) big = big_file(cache);
+    if (big.empty()) big = plimo_bench::big_file(cache);
     if (big.empty()) {
         std::fprintf(stderr, "no large file (ffmpeg missing?); skipped\n");
         return 0;

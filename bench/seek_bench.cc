@@ -22,6 +22,7 @@
 
 #include "asf_api.h"
 #include "bench_files.h"
+#include "lean_host.h"
 #include "loader.h"
 #include "raw_input.h"
 
@@ -62,64 +63,7 @@ Bytes without_index(const Bytes& file) {
     return Bytes(file.begin(), file.begin() + static_cast<std::ptrdiff_t>(end));
 }
 
-// A host that only hands out frame buffers and remembers the last commit.
-class LeanHost {
-public:
-    LeanHost() {
-        table_.notify = [](void*, hova_stream_type_et, hova_event_et) { return 0; };
-        table_.malloc = [](void*, size_t n) { return std::malloc(n ? n : 1); };
-        table_.realloc = [](void*, void*, size_t) -> void* { return nullptr; };
-        table_.freep = [](void*, void* pp) {
-            void** p = static_cast<void**>(pp);
-            std::free(*p);
-            *p = nullptr;
-        };
-        table_.get_time = [](void*) -> int64_t { return 0; };
-        table_.stream_alloc = [](void* c, hova_stream_type_et t, void** b, int n) {
-            return self(c)->frame(t, b, n);
-        };
-        table_.stream_realloc = [](void* c, hova_stream_type_et t, void** b, int n) {
-            return self(c)->frame(t, b, n);
-        };
-        table_.stream_discard = [](void*, hova_stream_type_et) { return 0; };
-        table_.stream_commit = [](void* c, hova_stream_type_et t, int, int64_t pts, int64_t, int kind) {
-            if (kind == 0) {
-                self(c)->last_type = t;
-                self(c)->last_pts = pts;
-            }
-            return 0;
-        };
-        table_.stream_check_rbuf_size = [](void*, hova_stream_type_et) { return 0; };
-        table_.context = this;
-    }
-    ~LeanHost() {
-        for (auto& f : frames_) std::free(f.base);
-    }
-    LeanHost(const LeanHost&) = delete;
-    LeanHost& operator=(const LeanHost&) = delete;
-    const hova_callback_st* table() const { return &table_; }
-    hova_stream_type_et last_type = HOVA_STREAM_NONE;
-    int64_t last_pts = -1;
-
-private:
-    static LeanHost* self(void* c) { return static_cast<LeanHost*>(c); }
-    int frame(hova_stream_type_et t, void** b, int n) {
-        Frame& f = frames_[t & 15];
-        if (static_cast<size_t>(n) > f.cap) {
-            const size_t cap = std::max<size_t>(static_cast<size_t>(n), f.cap * 2 + 65536);
-            f.base = static_cast<uint8_t*>(std::realloc(f.base, cap));
-            f.cap = cap;
-        }
-        *b = f.base;
-        return 0;
-    }
-    struct Frame {
-        uint8_t* base = nullptr;
-        size_t cap = 0;
-    };
-    Frame frames_[16];
-    hova_callback_st table_{};
-};
+using plimo_bench::LeanHost;
 
 struct Figures {
     bool ok = false;
