@@ -56,8 +56,10 @@ int on_file_prop(Walk& w, uint64_t& size) {
     d->packet_size = min_packet;
     const uint64_t preroll = load_le<uint64_t>(b + fp::kPreroll);
     d->preroll = static_cast<uint32_t>(preroll);
-    d->s.duration = static_cast<int64_t>(load_le<uint64_t>(b + fp::kPlayDuration) / 10) -
-                    static_cast<int64_t>(preroll * 1000);
+    // Unsigned arithmetic: both fields are untrusted and the signed difference
+    // could overflow. For any real file this is the plain difference.
+    d->s.duration = static_cast<int64_t>(load_le<uint64_t>(b + fp::kPlayDuration) / 10 -
+                                         preroll * 1000);
     if (load_le<uint32_t>(b + fp::kFlags) & fp::kFlagBroadcast) {
         ASF_LOG("Broadcast flag is set!\n");
         d->s.duration = 0;
