@@ -130,14 +130,8 @@ void before_playing(const hova_dmx_func_st* dmx, void* ctx, const Options& opts)
 }  // namespace
 
 int run_frames(const hova_dmx_func_st* dmx, const Options& opts) {
-    host::SessionOptions so;
-    so.input = opts.input;
-    so.ring_size = opts.ring_size;
-    auto session = host::Session::from_file(dmx, opts.file, so);
-    if (!session) {
-        std::fprintf(stderr, "asfdump: cannot read %s\n", opts.file.c_str());
-        return kExitUnreadable;
-    }
+    auto session = make_session(dmx, opts);
+    if (!session) return kExitUnreadable;
     StreamDump dump;
     if (!opts.dump_dir.empty() && !dump.open(opts.dump_dir)) {
         std::fprintf(stderr, "asfdump: cannot write into %s\n", opts.dump_dir.c_str());
@@ -157,11 +151,7 @@ int run_frames(const hova_dmx_func_st* dmx, const Options& opts) {
         }
     };
 
-    const int rc = session->open();
-    if (rc != HOVA_OK) {
-        std::fprintf(stderr, "asfdump: open failed: %s\n", host::errno_name(rc));
-        return kExitOpenFailed;
-    }
+    if (!open_session(*session)) return kExitOpenFailed;
     void* ctx = session->context();
     before_playing(dmx, ctx, opts);
 

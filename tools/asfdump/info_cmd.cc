@@ -192,22 +192,9 @@ json video_json(const hova_video_info_st& v) {
 }  // namespace
 
 int run_info(const hova_dmx_func_st* dmx, const Options& opts) {
-    host::SessionOptions so;
-    so.input = opts.input;
-    so.ring_size = opts.ring_size;
-    auto session = host::Session::from_file(dmx, opts.file, so);
-    if (!session) {
-        std::fprintf(stderr, "asfdump: cannot read %s\n", opts.file.c_str());
-        return kExitUnreadable;
-    }
-    const int rc = session->open();
-    if (rc != HOVA_OK) {
-        std::fprintf(stderr, "asfdump: open failed: %s\n", host::errno_name(rc));
-        if (session->blocks_outstanding() != 0)
-            std::fprintf(stderr, "asfdump: %zu blocks still held after the failed open\n",
-                         session->blocks_outstanding());
-        return kExitOpenFailed;
-    }
+    auto session = make_session(dmx, opts);
+    if (!session) return kExitUnreadable;
+    if (!open_session(*session)) return kExitOpenFailed;
     void* ctx = session->context();
 
     hova_clip_info_st clip{};
