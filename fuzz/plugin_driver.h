@@ -93,7 +93,8 @@ inline bool deliver_once(host::Session& s, int* budget) {
     hova_stream_type_et type = HOVA_STREAM_NONE;
     int size = 0;
     int64_t pts = 0;
-    const int rc = guarded("get_data", {HOVA_OK, HOVA_TryAgain, HOVA_EndOfStream},
+    // NotEnoughMemory: the host refused a configuration record.
+    const int rc = guarded("get_data", {HOVA_OK, HOVA_TryAgain, HOVA_EndOfStream, HOVA_NotEnoughMemory},
                            [&] { return s.dmx()->get_data(s.context(), &type, &size, &pts); });
     return rc != HOVA_EndOfStream;
 }
