@@ -103,18 +103,6 @@ TEST(Metadata, CoverPicture) {
     }
 }
 
-TEST(Metadata, JpegCoverOffsetIsBehindTypeLengthMimeAndDescription) {
-    const Bytes pic = picture_bytes(5000, 3);
-    Opening op(file_with({asfb::extended_content_description(
-                              {{"WM/Picture", 1, asfb::picture_value(3, "image/jpeg", "", pic)}}),
-                          asfb::audio_stream(1)}));
-    ASSERT_EQ(op.o.rc, HOVA_OK);
-    const size_t value_at = find(op.bytes, asfb::picture_value(3, "image/jpeg", "", pic));
-    EXPECT_EQ(op.d()->pic_offset, value_at + 5 + 22 + 2);
-    EXPECT_EQ(op.d()->cover.length, 5000);
-    EXPECT_TRUE(op.o.close_clean());
-}
-
 TEST(Metadata, AlbumYearAndGenre) {
     const struct {
         const char* what;
