@@ -3,6 +3,7 @@
 #pragma once
 
 #include <gtest/gtest.h>
+#include <zlib.h>
 
 #include <memory>
 #include <vector>
@@ -129,6 +130,8 @@ inline Bytes av_file(std::vector<Bytes> packets, uint32_t packet_size = 1024,
     f.packets = std::move(packets);
     return asfb::build_packet_file(f);
 }
+
+inline uint32_t crc(const Bytes& b) { return static_cast<uint32_t>(crc32_z(0, b.data(), b.size())); }
 
 inline Bytes concat(std::initializer_list<Bytes> parts) {
     Bytes out;

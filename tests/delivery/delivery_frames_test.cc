@@ -1,7 +1,5 @@
 // Reassembly of media objects from payloads, their times, and what a damaged
 // packet or a refusing host costs.
-#include <zlib.h>
-
 #include <set>
 
 #include "asf_packet.h"
@@ -11,9 +9,6 @@ namespace delivery {
 namespace {
 
 using asfb::Payload;
-
-uint32_t crc(const Bytes& b) { return static_cast<uint32_t>(crc32_z(0, b.data(), b.size())); }
-
 
 Bytes one(const Payload& p, uint32_t size) { return asfb::packet({p}, size); }
 

@@ -1,7 +1,5 @@
 // Separate parsing of badly interleaved files, the end of the data with the
 // scan for a new header, and the thumbnail rule.
-#include <zlib.h>
-
 #include "asf_internal.h"
 #include "asf_modes.h"
 #include "asf_packet.h"
@@ -10,8 +8,6 @@
 
 namespace delivery {
 namespace {
-
-uint32_t crc(const Bytes& b) { return static_cast<uint32_t>(crc32_z(0, b.data(), b.size())); }
 
 // Audio objects at a_start + 40k ms and video objects at v_start + 40k ms,
 // n of each, alternating in the file (audio first).
@@ -170,20 +166,6 @@ TEST(EndOfData, ScansForANewHeaderWhenTheInputAsksForIt) {
         EXPECT_EQ(pl.frames(HOVA_STREAM_AUDIO).size(), 1u);
         pl.expect_clean_close();
     }
-}
-
-TEST(EndOfData, NoticesGoToTheActiveStreamsAudioFirst) {
-    const auto objs = skewed(3, 0, 0);
-    Player pl(av_file(asfb::mux(objs, 1024), 1024));
-    pl.open_or_fail();
-    ASSERT_EQ(pl.play(), HOVA_EndOfStream);
-    const auto& ev = pl.host.events();
-    ASSERT_GE(ev.size(), 2u);
-    EXPECT_EQ(ev[ev.size() - 2].kind, EventKind::Notify);
-    EXPECT_EQ(ev[ev.size() - 2].type, HOVA_STREAM_AUDIO);
-    EXPECT_EQ(ev.back().kind, EventKind::Notify);
-    EXPECT_EQ(ev.back().type, HOVA_STREAM_VIDEO);
-    pl.expect_clean_close();
 }
 
 TEST(Thumbnail, DeliversKeyFramesSpacedByTheInterval) {

@@ -1,7 +1,5 @@
 // Packet and payload headers read from an opened file: the reader stands on
 // the first data packet after open.
-#include <zlib.h>
-
 #include "asf_packet.h"
 #include "delivery_fixture.h"
 
@@ -26,10 +24,6 @@ TEST(PacketHeader, ReadsTheCommonLayoutWithTwoPayloads) {
     const uint32_t used = 14 + 17 + 1000 + 17 + 50;
     const uint32_t packet_size = used + 16;
     const Bytes pkt = asfb::packet({first, second}, packet_size);
-    const Bytes expected_head = {0x82, 0x00, 0x00, 0x11, 0x5D, 0x10, 0x00};
-    ASSERT_TRUE(std::equal(expected_head.begin(), expected_head.end(), pkt.begin()));
-    EXPECT_EQ(pkt[13], 0x82);  // payload flags: 2 payloads, 16-bit lengths
-
     Opened o(av_file({pkt}, packet_size));
     asf_packet_st p{};
     p.media_object_size = 1;

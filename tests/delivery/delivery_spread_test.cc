@@ -1,13 +1,9 @@
 // Spread audio is put back in order before it is committed.
-#include <zlib.h>
-
 #include "delivery_fixture.h"
 #include "test_env.h"
 
 namespace delivery {
 namespace {
-
-uint32_t crc(const Bytes& b) { return static_cast<uint32_t>(crc32_z(0, b.data(), b.size())); }
 
 Bytes chunks(std::initializer_list<int> order, size_t chunk_len) {
     Bytes out;

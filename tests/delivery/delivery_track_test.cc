@@ -1,12 +1,8 @@
 // Track selection: streams can only be switched off.
-#include <zlib.h>
-
 #include "delivery_fixture.h"
 
 namespace delivery {
 namespace {
-
-uint32_t crc(const Bytes& b) { return static_cast<uint32_t>(crc32_z(0, b.data(), b.size())); }
 
 std::vector<asfb::Object> objects(uint32_t n, uint32_t video_start) {
     std::vector<asfb::Object> objs;
