@@ -60,7 +60,7 @@ TEST(Resync, FlushOnlyForMinusOneOtherwiseRestartAtTheInputsPosition) {
             // Delivery reads on at packet 40 and commits whole frames only.
             p.host.events().clear();
             ASSERT_EQ(p.play(), HOVA_EndOfStream);
-            const auto v = seektest::media(p, HOVA_STREAM_VIDEO);
+            const auto v = p.frames(HOVA_STREAM_VIDEO);
             ASSERT_FALSE(v.empty());
             EXPECT_EQ(v.front().pts, 4000000);
         }

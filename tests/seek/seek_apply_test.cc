@@ -95,7 +95,7 @@ TEST(SeekEffect, AppliedSeekDropsPartialObjectsAndResumesAtTheKeyFrame) {
     ref.host.keep_bytes = true;
     ref.open_or_fail();
     ASSERT_EQ(ref.play(), HOVA_EndOfStream);
-    const auto all = seektest::media(ref, HOVA_STREAM_VIDEO);
+    const auto all = ref.frames(HOVA_STREAM_VIDEO);
 
     for (int dir : {HOVA_SEEK_BACKWARD, HOVA_SEEK_FORWARD}) {
         SCOPED_TRACE(dir);
@@ -115,7 +115,7 @@ TEST(SeekEffect, AppliedSeekDropsPartialObjectsAndResumesAtTheKeyFrame) {
         EXPECT_EQ(p.ctx()->seeked, 1);
         p.host.events().clear();
         ASSERT_EQ(p.play(), HOVA_EndOfStream);
-        const auto v = seektest::media(p, HOVA_STREAM_VIDEO);
+        const auto v = p.frames(HOVA_STREAM_VIDEO);
         ASSERT_FALSE(v.empty());
         const auto ref_frame = std::find_if(all.begin(), all.end(),
                                             [&](const host::HostEvent& e) { return e.pts == t; });
@@ -137,10 +137,10 @@ TEST(SeekEffect, SeekAfterTheEndOfStreamPlaysAgain) {
         ASSERT_EQ(seektest::seek(p, HOVA_SEEK_BACKWARD, &t), HOVA_OK);
         EXPECT_EQ(t, 2000000);
         ASSERT_EQ(p.play(), HOVA_EndOfStream);
-        const auto v = seektest::media(p, HOVA_STREAM_VIDEO);
+        const auto v = p.frames(HOVA_STREAM_VIDEO);
         ASSERT_EQ(v.size(), 79u);  // 2.0 s to 9.8 s; the last stays pending
         EXPECT_EQ(v.front().pts, 2000000);
-        EXPECT_EQ(seektest::media(p, HOVA_STREAM_AUDIO).front().pts, 2000000);
+        EXPECT_EQ(p.frames(HOVA_STREAM_AUDIO).front().pts, 2000000);
     }
     p.expect_clean_close();
 }
@@ -165,8 +165,8 @@ TEST(SeekEffect, SeparateParsingPlacesBothCursors) {
         "[ASF] seek in separate mode, audio pts 5000000, packet 20, video pts 5000000, packet 50\n"));
     EXPECT_EQ(p.ctx()->accept_stream_type, HOVA_STREAM_VIDEO);
     ASSERT_EQ(p.play(), HOVA_EndOfStream);
-    EXPECT_EQ(seektest::media(p, HOVA_STREAM_VIDEO).front().pts, 5000000);
-    EXPECT_EQ(seektest::media(p, HOVA_STREAM_AUDIO).front().pts, 5000000);
+    EXPECT_EQ(p.frames(HOVA_STREAM_VIDEO).front().pts, 5000000);
+    EXPECT_EQ(p.frames(HOVA_STREAM_AUDIO).front().pts, 5000000);
 
     // Delivery ran off the end in separate parsing; a query already returns
     // to it, and the next seek places both cursors again.
@@ -182,7 +182,7 @@ TEST(SeekEffect, SeparateParsingPlacesBothCursors) {
     EXPECT_TRUE(log.contains(
         "[ASF] seek in separate mode, audio pts 4000000, packet 10, video pts 4000000, packet 40\n"));
     ASSERT_EQ(p.play(), HOVA_EndOfStream);
-    EXPECT_EQ(seektest::media(p, HOVA_STREAM_AUDIO).front().pts, 4000000);
+    EXPECT_EQ(p.frames(HOVA_STREAM_AUDIO).front().pts, 4000000);
     p.expect_clean_close();
 }
 
@@ -204,13 +204,9 @@ TEST(SeekEffect, SeparateParsingFallsBackToSequentialWhenAudioIsNotFound) {
     EXPECT_EQ(p.ctx()->accept_stream_type, HOVA_STREAM_NONE);
     EXPECT_EQ(p.ctx()->cur_packets, 80u);
     ASSERT_EQ(p.play(), HOVA_EndOfStream);
-    EXPECT_EQ(seektest::media(p, HOVA_STREAM_VIDEO).front().pts, 8000000);
+    EXPECT_EQ(p.frames(HOVA_STREAM_VIDEO).front().pts, 8000000);
     p.expect_clean_close();
 }
-
-}  // namespace
-
-namespace {
 
 // Damaged packets and index entries: seeks fail or land somewhere, but never
 // crash, hang, leak or leave a partial object pending at the host.

@@ -135,9 +135,4 @@ inline int seek(Player& p, int dir, int64_t* pts, int query = 0) {
     return hova_asff_demuxer.seek_time(p.ctx(), dir, pts, query);
 }
 
-// Media frames (not configuration records) of a kind, in commit order.
-inline std::vector<host::HostEvent> media(const Player& p, hova_stream_type_et t) {
-    return p.frames(t);
-}
-
 }  // namespace seektest

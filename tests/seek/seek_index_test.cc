@@ -63,7 +63,7 @@ TEST(IndexSeek, WalksFromTheTargetsEntryToTheNextDistinctKeyFrame) {
         }
         // Delivery resumes with the video frame found.
         ASSERT_EQ(p.play(), HOVA_EndOfStream);
-        const auto v = seektest::media(p, HOVA_STREAM_VIDEO);
+        const auto v = p.frames(HOVA_STREAM_VIDEO);
         ASSERT_FALSE(v.empty());
         EXPECT_EQ(v.front().pts, c.found);
         p.expect_clean_close();
@@ -140,8 +140,8 @@ TEST(IndexSeek, IndexThatCannotAnswerLeavesTheSeekToTheSearch) {
                 EXPECT_TRUE(log.contains("[ASF] seek without index, type 3\n"));
             }
             ASSERT_EQ(p.play(), HOVA_EndOfStream);
-            ASSERT_FALSE(seektest::media(p, HOVA_STREAM_VIDEO).empty());
-            EXPECT_EQ(seektest::media(p, HOVA_STREAM_VIDEO).front().pts, t);
+            ASSERT_FALSE(p.frames(HOVA_STREAM_VIDEO).empty());
+            EXPECT_EQ(p.frames(HOVA_STREAM_VIDEO).front().pts, t);
             p.expect_clean_close();
         }
     }

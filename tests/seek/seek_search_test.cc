@@ -74,7 +74,7 @@ TEST(SearchWithoutIndex, FindsTheNearestObjectStartInTheAskedDirection) {
         if (c.rc == HOVA_OK) {
             ASSERT_EQ(p.play(), HOVA_EndOfStream);
             const auto kind = c.clip.video ? HOVA_STREAM_VIDEO : HOVA_STREAM_AUDIO;
-            const auto f = seektest::media(p, kind);
+            const auto f = p.frames(kind);
             ASSERT_FALSE(f.empty());
             EXPECT_EQ(f.front().pts, c.found);
         }
@@ -134,8 +134,8 @@ TEST(SearchWithoutIndex, TimeZeroGoesToPacketZeroWithoutProbing) {
         EXPECT_EQ(p.ctx()->cur_packets, 0u);
         p.host.events().clear();
         ASSERT_EQ(p.play(), HOVA_EndOfStream);
-        EXPECT_EQ(seektest::media(p, HOVA_STREAM_VIDEO).front().pts, 0);
-        EXPECT_EQ(seektest::media(p, HOVA_STREAM_AUDIO).front().pts, 0);
+        EXPECT_EQ(p.frames(HOVA_STREAM_VIDEO).front().pts, 0);
+        EXPECT_EQ(p.frames(HOVA_STREAM_AUDIO).front().pts, 0);
         p.expect_clean_close();
     }
 }
