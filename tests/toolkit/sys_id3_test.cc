@@ -116,16 +116,6 @@ TEST_F(Id3, YearFromTdrcAndLaterFramesReplaceEarlierOnes) {
     EXPECT_EQ(str(program.title), "second");
 }
 
-TEST_F(Id3, TrackNumberTextGivesItsLeadingNumber) {
-    open(tkb::cat({tkb::id3_tag(3, tkb::id3_frames(3, {text_frame("TRCK", 0, text("7/10"))})), kAudio}));
-    ASSERT_EQ(parse(), 1);
-    EXPECT_EQ(info().CDTrackNumber.size, 4u);
-    EXPECT_EQ(info().CDTrackNumber.stringformat, HOVA_STRING_FORMAT_ASCII);
-    hova_program_info_st program{};
-    get_id3_info(&program, &info());
-    EXPECT_EQ(program.track_number, 7);
-}
-
 TEST(Id3Find, SearchesTheFirst257Positions) {
     struct Case {
         size_t at;
@@ -533,21 +523,22 @@ TEST(Id3Helpers, SmallPiecesBehaveAtTheirEdges) {
 
 TEST(Id3Helpers, NumbersReadLeadingDigitsOnly) {
     const std::pair<std::string, int> cases[] = {
-        {"1999", 1999}, {"  -12abc", -12}, {"+7", 7}, {"", 0},
+        {"1999", 1999}, {"7/10", 7}, {"  -12abc", -12}, {"+7", 7}, {"", 0},
         {"x12", 0}, {"99999999999", INT_MAX}, {"-99999999999", INT_MIN},
     };
     for (const auto& [textv, value] : cases) {
         std::string buf = textv;
         ST_ID3_INFO id3{};
-        id3.eID3TagFlags = ID3_YEAR | ID3_DISCNUMBER;
+        id3.eID3TagFlags = ID3_YEAR | ID3_DISCNUMBER | ID3_CDTRACKNUMBER;
         id3.Year = {static_cast<unsigned>(buf.size()), reinterpret_cast<unsigned char*>(buf.data()),
                     HOVA_STRING_FORMAT_ASCII};
-        id3.DiscNumber = id3.Year;
+        id3.DiscNumber = id3.CDTrackNumber = id3.Compilation = id3.Year;
         hova_program_info_st program{};
         get_id3_info(&program, &id3);
         EXPECT_EQ(program.year, value) << textv;
         EXPECT_EQ(program.disc_number, value) << textv;
-        EXPECT_EQ(program.track_number, 0) << "not flagged, not touched";
+        EXPECT_EQ(program.track_number, value) << textv;
+        EXPECT_EQ(program.compilation, 0) << "not flagged, not touched";
     }
 }
 
