@@ -217,14 +217,6 @@ TEST(HostFrames, MisuseIsRecordedAsAProtocolError) {
     EXPECT_EQ(buf, nullptr) << "a refused allocation stores null";
 }
 
-TEST(HostClock, AdvancesAsTheTestSays) {
-    Host h;
-    h.cb.now_us = 1000;
-    h.cb.clock_step_us = 250;
-    EXPECT_EQ(h.t->get_time(h.ctx), 1000);
-    EXPECT_EQ(h.t->get_time(h.ctx), 1250);
-}
-
 TEST(Loader, ReportsMissingLibrariesAndAlignsNothingForTheHost) {
     host::PluginLoader loader;
     EXPECT_FALSE(loader.load("/nonexistent/libplimo_asf.so"));
