@@ -18,32 +18,16 @@ TEST(Descriptor, LoadsByNameAndFillsTheSlotsTheHostCalls) {
     ASSERT_TRUE(loader.load(testenv::plugin_path())) << loader.error();
     const hova_dmx_func_st* d = loader.descriptor();
     ASSERT_NE(d, nullptr);
-    EXPECT_NE(d->probe, nullptr);
-    EXPECT_NE(d->open_file, nullptr);
-    EXPECT_NE(d->close_file, nullptr);
-    EXPECT_NE(d->get_info, nullptr);
-    EXPECT_NE(d->get_data, nullptr);
-    EXPECT_NE(d->seek_time, nullptr);
-    EXPECT_NE(d->resync_time, nullptr);
-    EXPECT_NE(d->set_track, nullptr);
-    EXPECT_NE(d->set_drop, nullptr);
-    EXPECT_NE(d->set_multi_thumb, nullptr);
-    EXPECT_NE(d->notify_event, nullptr);
+    EXPECT_TRUE(d->probe && d->open_file && d->close_file && d->get_info && d->get_data &&
+                d->seek_time && d->resync_time && d->set_track && d->set_drop &&
+                d->set_multi_thumb && d->notify_event);
     // Slots the plug-in does not offer are left empty for the host to test.
-    EXPECT_EQ(d->set_edition, nullptr);
-    EXPECT_EQ(d->release_data, nullptr);
-    EXPECT_EQ(d->get_frame_info, nullptr);
-    EXPECT_EQ(d->get_frame_data, nullptr);
-    EXPECT_EQ(d->reset_avframe, nullptr);
-    EXPECT_EQ(d->discard_avframe, nullptr);
-    EXPECT_EQ(d->queue_avframe, nullptr);
-    EXPECT_EQ(d->deliver_avframe, nullptr);
-    EXPECT_EQ(d->peek_avframe, nullptr);
-    EXPECT_EQ(d->set_unset_temi_config, nullptr);
-    EXPECT_EQ(d->get_timeline_info, nullptr);
-    EXPECT_EQ(d->support_avframe_video, 0);
-    EXPECT_EQ(d->support_avframe_audio, 0);
-    EXPECT_EQ(d->support_fast_track_switch, 0);
+    EXPECT_FALSE(d->set_edition || d->release_data || d->get_frame_info || d->get_frame_data ||
+                 d->reset_avframe || d->discard_avframe || d->queue_avframe ||
+                 d->deliver_avframe || d->peek_avframe || d->set_unset_temi_config ||
+                 d->get_timeline_info);
+    EXPECT_FALSE(d->support_avframe_video || d->support_avframe_audio ||
+                 d->support_fast_track_switch);
     ASSERT_NE(loader.disable_log_getter(), nullptr);
     EXPECT_EQ(loader.disable_log_getter()(), 0);
 }
