@@ -4,7 +4,6 @@
 
 #include <vector>
 
-#include "dprintf.h"
 #include "plimo_string.h"
 #include "test_env.h"
 
@@ -76,30 +75,18 @@ TEST(Utf16ToUtf8, OddTrailingByteIsNotReadPastTheRange) {
     EXPECT_EQ(calculate_UTF16_to_UTF8_size(in.data(), in.data() + 1), 1);
 }
 
-TEST(Utf16ToUtf8, InvalidInputIsLoggedUnlessTheSwitchIsSet) {
+// The log switch itself is checked in log_test.cc.
+TEST(Utf16ToUtf8, InvalidInputIsLoggedAndWritesNothing) {
     const std::vector<uint8_t> in = units({0x41, 0x00});
     uint8_t out[8] = {0x55};
-    for (int disabled : {0, 1}) {
-        testenv::LogCapture log;
-        kesto_disable_log = disabled;
-        EXPECT_EQ(calculate_UTF16_to_UTF8_size(in.data(), in.data()), 0);
-        convert_UTF16_to_UTF8(in.data(), in.data() + 4, nullptr);
-        convert_UTF16_to_UTF8(in.data() + 4, in.data(), out);
-        kesto_disable_log = 0;
-        EXPECT_EQ(out[0], 0x55) << "nothing written for an inverted range";
-        if (disabled) {
-            EXPECT_TRUE(log.lines().empty());
-            continue;
-        }
-        ASSERT_EQ(log.lines().size(), 3u);
-        EXPECT_EQ(log.lines()[0].text, "calculate UTF16 to UTF8 error : invalid input\n");
-        EXPECT_EQ(log.lines()[1].text,
-                  "convert UTF16 to UTF8 error : target is NULL or invalid input\n");
-        for (const auto& l : log.lines()) {
-            EXPECT_EQ(l.priority, ANDROID_LOG_DEBUG);
-            EXPECT_EQ(l.tag, "[PLIMO]");
-        }
-    }
+    testenv::LogCapture log;
+    EXPECT_EQ(calculate_UTF16_to_UTF8_size(in.data(), in.data()), 0);
+    convert_UTF16_to_UTF8(in.data(), in.data() + 4, nullptr);
+    convert_UTF16_to_UTF8(in.data() + 4, in.data(), out);
+    EXPECT_EQ(out[0], 0x55) << "nothing written for an inverted range";
+    ASSERT_EQ(log.lines().size(), 3u);
+    EXPECT_EQ(log.lines()[0].text, "calculate UTF16 to UTF8 error : invalid input\n");
+    EXPECT_EQ(log.lines()[1].text, "convert UTF16 to UTF8 error : target is NULL or invalid input\n");
 }
 
 }  // namespace
