@@ -62,6 +62,24 @@ TEST(Regress, FilePropertiesDurationAndPrerollAtTheirExtremes) {
     }
 }
 
+// The corpus's damaged file (a header built to loop a parser forever) goes
+// through the hang guard: every entry point in every buffering mode, with
+// and without host actions, returns within a second.
+TEST(Regress, DamagedCorpusFileNeverHangsAnyEntryPoint) {
+    REQUIRE_CORPUS_FILE(path, "musicmeta-CWE-835.wma");
+    const Bytes file = testenv::read_file_or_empty(path);
+    for (uint8_t buffering = 0; buffering < 4; ++buffering) {
+        SCOPED_TRACE(static_cast<int>(buffering));
+        Bytes input(plugfuzz::kModeBytes + plugfuzz::kOpBytes, 0);
+        input[0] = buffering;
+        const uint8_t ops[] = {0, 50, 2, 8, 0x0a, 200, 3, 4, 4, 1, 7, 0};
+        std::copy(std::begin(ops), std::end(ops), input.begin() + plugfuzz::kModeBytes);
+        input.insert(input.end(), file.begin(), file.end());
+        plugfuzz::modes_input(input.data(), input.size());
+    }
+    plugfuzz::play_input(file.data(), file.size());
+}
+
 std::vector<fs::path> kept_inputs(const std::string& target) {
     std::vector<fs::path> out;
     const fs::path dir = fs::path(PLIMO_SOURCE_DIR) / "tests/regress/inputs" / target;
