@@ -6,9 +6,9 @@
 // the rules, and the host holds nothing after close.
 //
 // Already swept elsewhere, and not repeated here: allocation failures during
-// open alone (tests/corpus), the header cut at every byte with the default
-// buffering (tests/asf, tests/corpus), the data cut and each stream_alloc
-// refused with the default buffering (tests/delivery).
+// open alone on every header object and the header cut at every byte with the
+// default buffering (tests/asf), the data cut and each stream_alloc refused
+// with the default buffering (tests/delivery).
 #include <gtest/gtest.h>
 
 #include <algorithm>
