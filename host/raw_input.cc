@@ -62,6 +62,17 @@ std::unique_ptr<RawInput> RawInput::from_file(const std::string& path, const Inp
     return in;
 }
 
+std::unique_ptr<RawInput> RawInput::from_url(const std::string& url, const InputOptions& opts,
+                                             std::string* error, const HttpOptions& http) {
+    auto source = HttpSource::open(url, error, http);
+    if (!source) return nullptr;
+    std::unique_ptr<RawInput> in(new RawInput());
+    in->size_ = source->size() == UINT64_MAX ? 0 : source->size();
+    in->http_ = std::move(source);
+    in->apply(opts);
+    return in;
+}
+
 void RawInput::set_seek_time_available(bool on) {
     io_.seek_time = on ? &RawInput::op_seek_time : nullptr;
 }
@@ -75,6 +86,12 @@ void RawInput::apply(const InputOptions& o) {
     io_.disable_cache = o.disable_cache ? 1 : 0;
     io_.detect_discontinuity = o.detect_discontinuity;
     io_.input_size = o.streaming ? size_ : 0;
+    if (http_) {
+        // What the framework sets for network input.
+        io_.streaming = 1;
+        io_.input_size = size_;
+        io_.seekable = o.seekable && http_->ranges() ? 1 : 0;
+    }
 }
 
 uint64_t RawInput::end_now() const {
@@ -83,6 +100,7 @@ uint64_t RawInput::end_now() const {
 }
 
 size_t RawInput::read_at(uint64_t pos, void* dst, size_t len) {
+    if (http_) return http_->read(pos, dst, len);
     if (fd_ >= 0) {
         size_t done = 0;
         while (done < len) {
@@ -142,6 +160,10 @@ cb_off_t RawInput::op_seek(cb_io_st* io, cb_off_t off, int whence) {
     }
     const cb_off_t target = base + off;
     if (target < 0) return -1;
+    // Without range support only what the open transfer serves is reachable.
+    if (in->http_ && static_cast<uint64_t>(target) != in->pos_ &&
+        !in->http_->reachable(static_cast<uint64_t>(target)))
+        return -1;
     in->counters_.seeks++;
     in->pos_ = static_cast<uint64_t>(target);
     return target;

@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "cb_io.h"
+#include "http_source.h"
 
 namespace host {
 
@@ -63,6 +64,11 @@ public:
     // Over a file read with pread; null when it cannot be opened.
     static std::unique_ptr<RawInput> from_file(const std::string& path,
                                                const InputOptions& opts = {});
+    // Over an http:// URL (see HttpSource): `streaming` is always set, with
+    // input_size from the response, and `seekable` only when the server takes
+    // range requests. Null with the reason in `error` when it cannot be opened.
+    static std::unique_ptr<RawInput> from_url(const std::string& url, const InputOptions& opts,
+                                              std::string* error, const HttpOptions& http = {});
     ~RawInput();
     RawInput(const RawInput&) = delete;
     RawInput& operator=(const RawInput&) = delete;
@@ -82,6 +88,9 @@ public:
     int open_done_result = 0;
     // Without it the io's seek_time slot is null, as some hosts leave it.
     void set_seek_time_available(bool on);
+
+    // The network side of an input made by from_url; null otherwise.
+    const HttpSource* http() const { return http_.get(); }
 
     // Recovers the object from the io pointer the plug-in hands back.
     static RawInput* of(cb_io_st* io);
@@ -108,6 +117,7 @@ private:
     std::vector<uint8_t> owned_;
     const uint8_t* data_ = nullptr;
     int fd_ = -1;
+    std::unique_ptr<HttpSource> http_;
     uint64_t size_ = 0;
     uint64_t pos_ = 0;
     uint64_t visible_ = UINT64_MAX;

@@ -19,4 +19,11 @@ std::unique_ptr<host::Session> make_session(const hova_dmx_func_st* dmx, const O
 // open_file; a failure is said on stderr.
 bool open_session(host::Session& session);
 
+// The raw input over the file or URL; null, said on stderr, when it cannot
+// be read.
+std::unique_ptr<host::RawInput> make_input(const Options& opts);
+// For a URL: what the network saw, and a transfer that failed, on stderr.
+// False when the transfer failed (the file could not be read to its end).
+bool report_network(const host::RawInput& input, const Options& opts);
+
 }  // namespace asfdump

@@ -151,7 +151,7 @@ int run_frames(const hova_dmx_func_st* dmx, const Options& opts) {
         }
     };
 
-    if (!open_session(*session)) return kExitOpenFailed;
+    if (!open_session(*session)) return report_network(session->input(), opts) ? kExitOpenFailed : kExitUnreadable;
     void* ctx = session->context();
     before_playing(dmx, ctx, opts);
 
@@ -186,7 +186,9 @@ int run_frames(const hova_dmx_func_st* dmx, const Options& opts) {
     end["blocks_outstanding"] = session->blocks_outstanding();
     emit(end);
     std::fflush(stdout);
-    return kExitOk;
+    // A connection cut during play ends the stream like the end of the file;
+    // the status says that the file was not read to its end.
+    return report_network(session->input(), opts) ? kExitOk : kExitUnreadable;
 }
 
 }  // namespace asfdump

@@ -194,7 +194,7 @@ json video_json(const hova_video_info_st& v) {
 int run_info(const hova_dmx_func_st* dmx, const Options& opts) {
     auto session = make_session(dmx, opts);
     if (!session) return kExitUnreadable;
-    if (!open_session(*session)) return kExitOpenFailed;
+    if (!open_session(*session)) return report_network(session->input(), opts) ? kExitOpenFailed : kExitUnreadable;
     void* ctx = session->context();
 
     hova_clip_info_st clip{};
@@ -241,7 +241,7 @@ int run_info(const hova_dmx_func_st* dmx, const Options& opts) {
                      session->blocks_outstanding());
         return kExitOpenFailed;
     }
-    return kExitOk;
+    return report_network(session->input(), opts) ? kExitOk : kExitUnreadable;
 }
 
 }  // namespace asfdump

@@ -55,6 +55,7 @@ const char* usage_text() {
     return "usage: asfdump probe FILE\n"
            "       asfdump info FILE [input options]\n"
            "       asfdump frames FILE [input options] [play options]\n"
+           "FILE may be an http:// URL (default buffering then: --buffer ring --thread)\n"
            "input options: --buffer cache|none|ring, --thread, --block-size N, --ring-size N,\n"
            "               --streaming, --not-seekable, --detect-discontinuity, --plugin PATH\n"
            "play options:  --seek US, --backward, --query, --resync US, --thumbnail US,\n"
@@ -65,6 +66,7 @@ bool parse_options(int argc, char** argv, Options* o, std::string* error) {
     optind = 1;
     opterr = 0;
     bool use_thread = false;
+    bool buffer_given = false;
     std::string buffer = "cache";
     int c;
     int64_t v = 0;
@@ -72,6 +74,7 @@ bool parse_options(int argc, char** argv, Options* o, std::string* error) {
         switch (c) {
             case kBuffer:
                 buffer = optarg;
+                buffer_given = true;
                 if (buffer != "cache" && buffer != "none" && buffer != "ring") {
                     *error = "--buffer takes cache, none or ring";
                     return false;
@@ -127,6 +130,13 @@ bool parse_options(int argc, char** argv, Options* o, std::string* error) {
     if (o->command != "probe" && o->command != "info" && o->command != "frames") {
         *error = "unknown command " + o->command;
         return false;
+    }
+    o->is_url = host::is_http_url(o->file);
+    // Network input defaults to what the framework uses for it: the ring
+    // filled by the streaming thread. Any buffering option replaces that.
+    if (o->is_url && !buffer_given && !use_thread) {
+        buffer = "ring";
+        use_thread = true;
     }
     if (use_thread && buffer != "ring") {
         *error = "--thread needs --buffer ring";

@@ -15,6 +15,7 @@ struct Options {
     host::InputOptions input;
     int ring_size = 1048576;
     bool not_seekable = false;
+    bool is_url = false;  // FILE is an http:// URL
     // play options
     bool has_seek = false;
     int64_t seek_us = 0;

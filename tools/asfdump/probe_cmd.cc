@@ -12,11 +12,8 @@ constexpr size_t kProbeBytes = 4096;
 }
 
 int run_probe(const hova_dmx_func_st* dmx, const Options& opts) {
-    auto input = host::RawInput::from_file(opts.file, opts.input);
-    if (!input) {
-        std::fprintf(stderr, "asfdump: cannot read %s\n", opts.file.c_str());
-        return kExitUnreadable;
-    }
+    auto input = make_input(opts);
+    if (!input) return kExitUnreadable;
     std::vector<uint8_t> head(kProbeBytes);
     const size_t got = input->io()->read(input->io(), head.data(), head.size());
     input->io()->seek(input->io(), 0, CB_SEEK_SET);
