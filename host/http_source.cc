@@ -5,6 +5,8 @@
 
 #include <algorithm>
 #include <chrono>
+#include <cstdio>
+#include <cstdlib>
 #include <cstring>
 #include <vector>
 
@@ -65,7 +67,10 @@ struct HttpSource::Impl {
 
     bool ranges = false;
     uint64_t size = UINT64_MAX;
-    std::string failure;
+    std::string failure;  // the first read that came up short for a network fault
+    // Why the open transfer ended early: reading on where it stopped fails
+    // at once (no retry); a read elsewhere starts a new request.
+    std::string broken;
     HttpStats stats;
 
     ~Impl() {
@@ -163,6 +168,11 @@ struct HttpSource::Impl {
     // Drops the open transfer (the connection goes with it when it was not
     // finished) and asks for the file from `pos` on.
     void start(uint64_t pos) {
+        // PLIMO_HTTP_TRACE=1: one line per request on stderr, to see where
+        // the reader jumps.
+        if (std::getenv("PLIMO_HTTP_TRACE"))
+            std::fprintf(stderr, "http: request from byte %llu (held %llu-%llu)\n", static_cast<unsigned long long>(pos),
+                         static_cast<unsigned long long>(buf_pos), static_cast<unsigned long long>(buf_end()));
         if (attached) curl_multi_remove_handle(multi, easy);
         attached = false;
         paused = false;
@@ -173,6 +183,7 @@ struct HttpSource::Impl {
         headers_done = false;
         have_range = false;
         content_length = UINT64_MAX;
+        broken.clear();
         buf.clear();
         buf_pos = pos;
         reader = pos;
@@ -202,6 +213,11 @@ struct HttpSource::Impl {
             if (m->msg == CURLMSG_DONE && m->easy_handle == easy) {
                 done = true;
                 result = m->data.result;
+                // The bytes that came stay readable; the input fails past them.
+                if (result != CURLE_OK && headers_done)
+                    broken = "connection cut at byte " + std::to_string(buf_end()) +
+                             (size != UINT64_MAX ? " of " + std::to_string(size) : std::string()) + " (" +
+                             curl_message() + ")";
             }
         }
         if (done) return false;
@@ -234,8 +250,9 @@ struct HttpSource::Impl {
         return "";
     }
 
-    void fail(std::string why) {
-        if (failure.empty()) failure = std::move(why);
+    void fail(const std::string& why) {
+        if (failure.empty()) failure = why;
+        broken = why;
         if (attached) curl_multi_remove_handle(multi, easy);
         attached = false;
         done = true;
@@ -267,12 +284,7 @@ struct HttpSource::Impl {
         while (buf_end() <= pos) {
             if (!pump(100)) {
                 ok = buf_end() > pos;
-                if (!ok && result != CURLE_OK) {
-                    const uint64_t at = buf_end();
-                    fail("connection cut at byte " + std::to_string(at) +
-                         (size != UINT64_MAX ? " of " + std::to_string(size) : std::string()) + " (" +
-                         curl_message() + ")");
-                }
+                if (!ok && !broken.empty()) fail(broken);
                 break;
             }
             const auto now = Clock::now();
@@ -293,7 +305,7 @@ struct HttpSource::Impl {
 
     size_t read(uint64_t pos, uint8_t* dst, size_t len) {
         size_t got = 0;
-        while (got < len && failure.empty()) {
+        while (got < len) {
             const uint64_t p = pos + got;
             if (p >= size) break;
             reader = std::max(reader, p);
@@ -304,6 +316,10 @@ struct HttpSource::Impl {
                 reader = p + n;
                 trim();
                 continue;
+            }
+            if (!broken.empty() && p == buf_end()) {
+                fail(broken);
+                break;
             }
             if (!ahead_within_reach(p)) {
                 if (!ranges) break;  // the file cannot be reached from here

@@ -1,0 +1,424 @@
+// The reference host's HTTP input against a real web server (lighttpd on
+// loopback, serving the corpus): every corpus file played by URL gives the
+// events it gives from the file in every buffering mode, a seek costs one
+// request, a server without range support plays in one pass and refuses
+// seeks, a connection cut halfway ends the stream without a hang, and asfdump
+// takes a URL where it takes a file.
+#include <gtest/gtest.h>
+
+#include <arpa/inet.h>
+#include <netinet/in.h>
+#include <poll.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <chrono>
+#include <cstdio>
+#include <cstring>
+#include <fstream>
+#include <memory>
+#include <sstream>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "asf_api.h"
+#include "local_web_server.h"
+#include "raw_input.h"
+#include "session.h"
+#include "test_env.h"
+
+namespace {
+
+using host::EventKind;
+using host::HostEvent;
+
+// One server for the whole suite.
+host::LocalWebServer* web_server(std::string* why) {
+    static std::unique_ptr<host::LocalWebServer> server;
+    static std::string reason;
+    static bool tried = false;
+    if (!tried) {
+        tried = true;
+        if (testenv::corpus_files().empty()) reason = "no corpus in " + testenv::corpus_dir();
+        else server = host::LocalWebServer::start(testenv::corpus_dir(), &reason);
+    }
+    *why = reason;
+    return server.get();
+}
+
+#define REQUIRE_WEB_SERVER(var)                 \
+    std::string var##_why;                      \
+    host::LocalWebServer* var = web_server(&var##_why); \
+    if (!var) GTEST_SKIP() << var##_why
+
+std::string base_name(const std::string& path) { return path.substr(path.find_last_of('/') + 1); }
+
+host::InputOptions mode(int m) {
+    host::InputOptions in;
+    if (m == 1) in.disable_cache = true;
+    if (m >= 2) in.rbuf_mode = CBIO_APPLY_RBUF;
+    if (m == 3) in.use_thread = true;
+    return in;
+}
+const char* const kModeNames[] = {"cache", "none", "ring", "ring+thread"};
+
+std::string describe(const HostEvent& e) {
+    std::ostringstream s;
+    s << e.call << ' ' << static_cast<int>(e.kind) << ' ' << e.type << ' ' << e.packet_type << ' ' << e.size << ' '
+      << e.pts << ' ' << std::hex << e.crc32 << ' ' << e.event;
+    return s.str();
+}
+
+struct Played {
+    int open_rc = -1;
+    int last = -1;
+    int seek_rc = -1;
+    int64_t seek_pts = 0;
+    std::vector<std::string> events;
+    size_t blocks = 1;
+    uint64_t requests = 0;
+    std::string failure;
+};
+
+// Opens, optionally seeks (`seek_us` >= 0) and plays to the end, or for at
+// most `max_calls` get_data calls after a seek.
+Played play(std::unique_ptr<host::RawInput> input, int64_t seek_us = -1, uint64_t max_calls = 2000000) {
+    Played out;
+    const host::HttpSource* http = input->http();
+    auto requests = [&] { return http ? http->stats().requests : 0; };
+    host::Session s(&hova_asff_demuxer, std::move(input));
+    out.open_rc = s.open();
+    if (out.open_rc == HOVA_OK) {
+        void* ctx = s.context();
+        host::HostCallbacks& cb = s.callbacks();
+        uint64_t calls = 0;
+        hova_stream_type_et t = HOVA_STREAM_NONE;
+        int bs = 0;
+        int64_t pts = 0;
+        if (seek_us >= 0) {
+            cb.call = ++calls;
+            (void)hova_asff_demuxer.get_data(ctx, &t, &bs, &pts);  // configuration records
+            out.seek_pts = seek_us;
+            out.seek_rc = hova_asff_demuxer.seek_time(ctx, HOVA_SEEK_BACKWARD, &out.seek_pts, 0);
+            const size_t first = cb.events().size();
+            bool framed = false;
+            while (!framed && calls < 1000) {
+                cb.call = ++calls;
+                out.last = hova_asff_demuxer.get_data(ctx, &t, &bs, &pts);
+                for (size_t i = first; i < cb.events().size(); ++i)
+                    framed = framed || (cb.events()[i].kind == EventKind::Commit && cb.events()[i].packet_type == 0);
+                if (out.last != HOVA_OK && out.last != HOVA_TryAgain) break;
+            }
+        }
+        while (calls < max_calls && (out.last == -1 || out.last == HOVA_OK || out.last == HOVA_TryAgain)) {
+            cb.call = ++calls;
+            out.last = hova_asff_demuxer.get_data(ctx, &t, &bs, &pts);
+        }
+        for (const HostEvent& e : cb.events()) out.events.push_back(describe(e));
+        s.close();
+    }
+    out.blocks = s.blocks_outstanding();
+    out.requests = requests();
+    if (http) out.failure = http->failure();
+    return out;
+}
+
+std::unique_ptr<host::RawInput> by_url(const std::string& url, host::InputOptions in) {
+    std::string why;
+    auto input = host::RawInput::from_url(url, in, &why);
+    EXPECT_TRUE(input) << url << ": " << why;
+    return input;
+}
+
+// The same raw input flags as the network input has: streaming with the
+// size known, so that the plug-in takes the same decisions.
+std::unique_ptr<host::RawInput> by_file(const std::string& path, host::InputOptions in) {
+    in.streaming = true;
+    return host::RawInput::from_file(path, in);
+}
+
+TEST(HttpInput, EveryCorpusFileByUrlGivesTheFileEventsInEveryMode) {
+    REQUIRE_WEB_SERVER(server);
+    for (const std::string& path : testenv::corpus_files()) {
+        for (int m = 0; m < 4; ++m) {
+            SCOPED_TRACE(base_name(path) + " " + kModeNames[m]);
+            auto input = by_url(server->url(base_name(path)), mode(m));
+            if (!input) continue;
+            EXPECT_EQ(input->io()->streaming, 1);
+            EXPECT_EQ(input->io()->seekable, 1);
+            EXPECT_EQ(input->io()->input_size, input->size());
+            const Played net = play(std::move(input));
+            const Played local = play(by_file(path, mode(m)));
+            EXPECT_EQ(net.open_rc, local.open_rc);
+            EXPECT_EQ(net.last, local.last);
+            EXPECT_EQ(net.events, local.events);
+            EXPECT_EQ(net.blocks, 0u);
+            EXPECT_EQ(net.failure, "");
+            // The first request, and at most a jump to the index and one back.
+            EXPECT_LE(net.requests, 3u);
+        }
+    }
+}
+
+// The input alone: a read where the open transfer is costs nothing, a read
+// anywhere else costs exactly one request, and the bytes are the file's.
+TEST(HttpInput, SeekCostsOneRequest) {
+    REQUIRE_WEB_SERVER(server);
+    REQUIRE_CORPUS_FILE(path, "moon-elephants-dream-first-minute.wmv");
+    const std::vector<uint8_t> file = testenv::read_file_or_empty(path);
+    const host::HttpOptions opt;
+    auto input = by_url(server->url(base_name(path)), {});
+    ASSERT_TRUE(input);
+    ASSERT_EQ(input->size(), file.size());
+    cb_io_st* io = input->io();
+    const int64_t size = static_cast<int64_t>(file.size());
+    struct Step {
+        const char* what;
+        int64_t to;  // where to seek first, -1: read on
+        size_t len;
+        uint64_t requests;
+    };
+    const int64_t rt = static_cast<int64_t>(opt.read_through), hist = static_cast<int64_t>(opt.history);
+    const Step steps[] = {
+        {"first bytes (the open's request)", -1, 4096, 0},
+        {"peek and back", 0, 4096, 0},
+        {"read on", -1, 100000, 0},
+        {"back within what was kept", 100000 - hist / 2, 1000, 0},
+        {"short skip forward reads through", 101000 + rt / 2, 1000, 0},
+        {"far forward", size / 2, 200000, 1},
+        {"far back", 100, 1000, 1},
+        {"the end", size - 100, 100, 1},
+        {"past the end", -1, 100, 0},
+        {"far forward again", 300000, 1000, 1},
+        // Beyond what may wait ahead (the window and one delivery) plus the gap.
+        {"forward past the read-through gap", 301000 + static_cast<int64_t>(opt.window) + 16384 + rt + 1, 1000, 1},
+    };
+    for (const Step& st : steps) {
+        SCOPED_TRACE(st.what);
+        if (st.to >= 0) {
+            ASSERT_EQ(io->seek(io, st.to, CB_SEEK_SET), st.to);
+        }
+        const uint64_t pos = input->position();
+        const uint64_t before = input->http()->stats().requests;
+        std::vector<uint8_t> got(st.len);
+        const size_t n = io->read(io, got.data(), got.size());
+        const size_t want = static_cast<size_t>(std::min<uint64_t>(st.len, file.size() - pos));
+        ASSERT_EQ(n, want);
+        EXPECT_TRUE(std::equal(got.begin(), got.begin() + static_cast<long>(n), file.begin() + static_cast<long>(pos)));
+        EXPECT_EQ(input->http()->stats().requests - before, st.requests);
+    }
+    EXPECT_EQ(input->http()->failure(), "");
+}
+
+// The plug-in's seek over the network lands where it lands from the file and
+// delivers the same frames after it.
+TEST(HttpInput, SeekByUrlLandsWhereTheFileLands) {
+    REQUIRE_WEB_SERVER(server);
+    for (const std::string& path : testenv::corpus_files()) {
+        const Played whole = play(by_file(path, mode(0)));
+        if (whole.open_rc != HOVA_OK) continue;
+        // Halfway through by the last media frame's time.
+        int64_t last_pts = 0;
+        for (const std::string& e : whole.events) {
+            std::istringstream f(e);
+            uint64_t call;
+            int kind, type, pt, size;
+            int64_t pts;
+            f >> call >> kind >> type >> pt >> size >> pts;
+            if (kind == 0 && pt == 0) last_pts = std::max(last_pts, pts);
+        }
+        if (last_pts <= 0) continue;
+        for (int m = 0; m < 4; ++m) {
+            SCOPED_TRACE(base_name(path) + " " + kModeNames[m]);
+            const Played net = play(by_url(server->url(base_name(path)), mode(m)), last_pts / 2, 200);
+            const Played local = play(by_file(path, mode(m)), last_pts / 2, 200);
+            EXPECT_EQ(net.seek_rc, local.seek_rc);
+            EXPECT_EQ(net.seek_pts, local.seek_pts);
+            EXPECT_EQ(net.events, local.events);
+            EXPECT_EQ(net.blocks, 0u);
+            EXPECT_EQ(net.failure, "");
+        }
+    }
+}
+
+TEST(HttpInput, ServerWithoutRangesPlaysInOnePassAndRefusesSeeks) {
+    REQUIRE_WEB_SERVER(server);
+    REQUIRE_CORPUS_FILE(path, "moon-elephants-dream-first-minute.wmv");
+    for (int m = 0; m < 4; ++m) {
+        SCOPED_TRACE(kModeNames[m]);
+        auto input = by_url(server->url(base_name(path), false), mode(m));
+        if (!input) continue;
+        EXPECT_FALSE(input->http()->ranges());
+        EXPECT_EQ(input->io()->seekable, 0);
+        host::InputOptions in = mode(m);
+        in.seekable = false;
+        const Played net = play(std::move(input));
+        const Played local = play(by_file(path, in));
+        EXPECT_EQ(net.events, local.events);
+        EXPECT_EQ(net.requests, 1u);
+        EXPECT_EQ(net.blocks, 0u);
+
+        const Played seek = play(by_url(server->url(base_name(path), false), mode(m)), 20000000, 50);
+        EXPECT_NE(seek.seek_rc, HOVA_OK);
+        EXPECT_EQ(seek.requests, 1u);
+        EXPECT_EQ(seek.blocks, 0u);
+    }
+}
+
+// Serves one file on loopback like a range-capable server, but every
+// response that starts in the first half of the file stops at its middle
+// and the connection closes. Handles one connection at a time; stops with
+// the object.
+class CuttingServer {
+public:
+    explicit CuttingServer(std::vector<uint8_t> file) : file_(std::move(file)) {
+        fd_ = ::socket(AF_INET, SOCK_STREAM, 0);
+        sockaddr_in a{};
+        a.sin_family = AF_INET;
+        a.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+        socklen_t len = sizeof a;
+        if (fd_ < 0 || ::bind(fd_, reinterpret_cast<sockaddr*>(&a), sizeof a) != 0 || ::listen(fd_, 8) != 0 ||
+            ::getsockname(fd_, reinterpret_cast<sockaddr*>(&a), &len) != 0)
+            return;
+        port_ = ntohs(a.sin_port);
+        thread_ = std::thread([this] { serve(); });
+    }
+    ~CuttingServer() {
+        stop_ = true;
+        if (thread_.joinable()) thread_.join();
+        if (fd_ >= 0) ::close(fd_);
+    }
+    std::string url() const { return "http://127.0.0.1:" + std::to_string(port_) + "/file.wmv"; }
+    bool ok() const { return port_ != 0; }
+
+private:
+    void serve() {
+        const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(60);
+        for (int served = 0; !stop_ && served < 64 && std::chrono::steady_clock::now() < deadline;) {
+            pollfd p{fd_, POLLIN, 0};
+            if (::poll(&p, 1, 50) != 1) continue;
+            const int c = ::accept(fd_, nullptr, nullptr);
+            if (c < 0) continue;
+            ++served;
+            timeval tv{2, 0};
+            ::setsockopt(c, SOL_SOCKET, SO_RCVTIMEO, &tv, sizeof tv);
+            ::setsockopt(c, SOL_SOCKET, SO_SNDTIMEO, &tv, sizeof tv);
+            respond(c);
+            ::close(c);
+        }
+    }
+    void respond(int c) {
+        std::string req;
+        char buf[1024];
+        while (req.find("\r\n\r\n") == std::string::npos && req.size() < 16384) {
+            const ssize_t n = ::recv(c, buf, sizeof buf, 0);
+            if (n <= 0) return;
+            req.append(buf, static_cast<size_t>(n));
+        }
+        uint64_t from = 0;
+        const size_t r = req.find("Range: bytes=");
+        if (r != std::string::npos) from = std::strtoull(req.c_str() + r + 13, nullptr, 10);
+        const uint64_t size = file_.size(), half = size / 2;
+        if (from >= size) from = size;
+        const uint64_t until = from < half ? half : size;
+        const std::string head = "HTTP/1.1 206 Partial Content\r\nContent-Length: " + std::to_string(size - from) +
+                                 "\r\nContent-Range: bytes " + std::to_string(from) + "-" +
+                                 std::to_string(size - 1) + "/" + std::to_string(size) +
+                                 "\r\nConnection: close\r\n\r\n";
+        if (!send_all(c, head.data(), head.size())) return;
+        send_all(c, file_.data() + from, static_cast<size_t>(until - from));
+    }
+    bool send_all(int c, const void* p, size_t n) {
+        const auto* b = static_cast<const uint8_t*>(p);
+        while (n > 0 && !stop_) {
+            const ssize_t k = ::send(c, b, n, MSG_NOSIGNAL);
+            if (k <= 0) return false;
+            b += k;
+            n -= static_cast<size_t>(k);
+        }
+        return n == 0;
+    }
+
+    std::vector<uint8_t> file_;
+    int fd_ = -1;
+    int port_ = 0;
+    std::atomic<bool> stop_{false};
+    std::thread thread_;
+};
+
+TEST(HttpInput, ConnectionCutHalfwayEndsTheStreamInEveryMode) {
+    REQUIRE_CORPUS_FILE(path, "moon-elephants-dream-first-minute.wmv");
+    CuttingServer server(testenv::read_file_or_empty(path));
+    ASSERT_TRUE(server.ok());
+    const Played whole = play(by_file(path, mode(0)));
+    for (int m = 0; m < 4; ++m) {
+        SCOPED_TRACE(kModeNames[m]);
+        const auto t0 = std::chrono::steady_clock::now();
+        const Played cut = play(by_url(server.url(), mode(m)));
+        EXPECT_LT(std::chrono::steady_clock::now() - t0, std::chrono::seconds(20));
+        ASSERT_EQ(cut.open_rc, HOVA_OK);
+        EXPECT_EQ(cut.last, HOVA_EndOfStream);
+        EXPECT_EQ(cut.blocks, 0u);
+        EXPECT_NE(cut.failure.find("connection cut at byte"), std::string::npos) << cut.failure;
+        // What was delivered before the cut is what the file gives; less of it.
+        ASSERT_GT(cut.events.size(), 10u);
+        ASSERT_LT(cut.events.size(), whole.events.size());
+        // Only the end differs: the objects pending at the cut and the
+        // end-of-stream notices.
+        const size_t same = static_cast<size_t>(
+            std::mismatch(cut.events.begin(), cut.events.end(), whole.events.begin()).first - cut.events.begin());
+        EXPECT_GE(same + 4, cut.events.size());
+    }
+}
+
+TEST(HttpInput, AsfdumpTakesAUrlWhereItTakesAFile) {
+    REQUIRE_WEB_SERVER(server);
+    REQUIRE_CORPUS_FILE(path, "moon-timecode-long-with-audio.wmv");
+    CuttingServer cutting(testenv::read_file_or_empty(path));
+    const std::string err = "/tmp/plimo_http_err_" + std::to_string(::getpid());
+    auto asfdump = [&](const std::string& args, std::string* out, std::string* stderr_text) {
+        const int rc = testenv::run_command(testenv::asfdump_path() + " " + args + " 2>" + err, out);
+        std::ifstream f(err);
+        std::stringstream t;
+        t << f.rdbuf();
+        *stderr_text = t.str();
+        return rc;
+    };
+    const std::string url = server->url(base_name(path));
+    struct Case {
+        std::string args;
+        int status;
+        std::string same_as;  // asfdump arguments over the file whose output must match ("" none)
+        std::string message;  // on stderr
+    };
+    const Case cases[] = {
+        {"frames " + url, 0, "frames '" + path + "' --streaming --buffer ring --thread", "asfdump: http: "},
+        {"frames " + url + " --buffer none --seek 10000000", 0, "frames '" + path + "' --streaming --buffer none --seek 10000000", ""},
+        {"info " + url, 0, "info '" + path + "' --streaming", ""},
+        {"probe " + url, 0, "probe '" + path + "'", ""},
+        {"frames " + server->url(base_name(path), false) + " --seek 10000000", 0, "", "ignores range requests"},
+        {"info " + server->url("no-such-file.wmv"), 3, "", "HTTP status 404"},
+        {"frames http://127.0.0.1:1/x.wmv", 3, "", "cannot read"},
+        {"frames " + cutting.url(), 3, "", "connection cut at byte"},
+    };
+    for (const Case& c : cases) {
+        SCOPED_TRACE(c.args);
+        std::string out, text, ref, ref_text;
+        EXPECT_EQ(asfdump(c.args, &out, &text), c.status) << text;
+        if (!c.message.empty()) {
+            EXPECT_NE(text.find(c.message), std::string::npos) << text;
+        }
+        if (!c.same_as.empty()) {
+            EXPECT_EQ(asfdump(c.same_as, &ref, &ref_text), 0) << ref_text;
+            EXPECT_EQ(out, ref);
+        }
+        if (c.status != 0 && c.args.rfind("frames", 0) == 0 && !out.empty()) {
+            EXPECT_NE(out.find("\"blocks_outstanding\":0"), std::string::npos) << "the cut stream closes cleanly";
+        }
+    }
+    ::unlink(err.c_str());
+}
+
+}  // namespace
