@@ -18,7 +18,6 @@ void reset_ring_at_input(cb_buffer_st* cb, bool move, int time_ms) {
     pthread_mutex_lock(&rb->ring_mutex);
     if (move && in->seek_time) (void)in->seek_time(in, time_ms);
     cb->curpos = static_cast<cb_fpos>(in->tell(in));
-    if (rb->wlock) rb->rlock = 1;
     sys_ringbuffer_reset_locked(rb);
     pthread_mutex_unlock(&rb->ring_mutex);
 }

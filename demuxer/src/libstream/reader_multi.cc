@@ -22,6 +22,14 @@ bool ring_has_thread(const cb_buffer_st* cb) { return cb->thread_type == CB_MULT
 
 }  // namespace
 
+bool rewind_ring(cb_buffer_st* cb, cb_off_t target) {
+    const cb_off_t cur = static_cast<cb_off_t>(cb->curpos);
+    if (target >= cur || cur - target > static_cast<cb_off_t>(UINT32_MAX)) return false;
+    if (!sys_ringbuffer_rewind(cb->active_rbuf, static_cast<uint32_t>(cur - target))) return false;
+    cb->curpos = static_cast<cb_fpos>(target);
+    return true;
+}
+
 void init_multi_thread_plugin(cb_buffer_st* cb) {
     cb->cb_read = cb_read_multi;
     cb->cb_peek = cb_peek_multi;
@@ -33,16 +41,12 @@ cb_off_t reposition_ring_input(cb_buffer_st* cb, cb_off_t target, int whence) {
     sys_ringbuffer* rb = cb->active_rbuf;
     cb_io_st* in = cb->input;
     // One critical section for the input move and the emptying of the ring:
-    // the thread reads the input only under this lock, so every block it
-    // reads is either wholly before this point or wholly after it. A block
-    // read before and not yet stored (wlock) is dropped by the ring when the
-    // thread stores it (rlock).
+    // the thread reads the input and stores what it read only under this
+    // lock, so every block is either wholly before this point (and emptied
+    // here) or wholly after it.
     pthread_mutex_lock(&rb->ring_mutex);
     const cb_off_t r = in->seek(in, target, whence);
-    if (r != -1) {
-        if (rb->wlock) rb->rlock = 1;
-        sys_ringbuffer_reset_locked(rb);
-    }
+    if (r != -1) sys_ringbuffer_reset_locked(rb);
     pthread_mutex_unlock(&rb->ring_mutex);
     return r;
 }
@@ -111,6 +115,8 @@ cb_off_t cb_seek_multi64(cb_buffer_st* cb, cb_off_t offset, int whence) {
         return static_cast<cb_off_t>(cb->curpos);
     }
     if (target < 0) return -1;
+    // Behind the read position, inside what the ring still keeps: read again.
+    if (rewind_ring(cb, target)) return target;
     // A refused move changes nothing: the ring still holds the bytes at curpos.
     const cb_off_t r = reposition_ring_input(cb, target, CB_SEEK_SET);
     if (r == -1) return -1;

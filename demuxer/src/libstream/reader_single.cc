@@ -19,6 +19,16 @@ int32_t read_direct(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
     return n;
 }
 
+// Inside the ring's held bytes or its history: forward consumes, backward
+// takes released bytes back.
+void skip_in_ring(cb_buffer_st* cb, cb_off_t target) {
+    const cb_off_t cur = static_cast<cb_off_t>(cb->curpos);
+    if (target > cur)
+        (void)cb->cb_read(cb, nullptr, static_cast<int32_t>(target - cur));
+    else if (target < cur)
+        (void)rewind_ring(cb, target);
+}
+
 }  // namespace
 
 void init_single_thread_plugin(cb_buffer_st* cb) {
@@ -64,10 +74,12 @@ int seek_out_of_buffer(cb_buffer_st* cb, cb_off_t offset, int whence) {
     switch (cb->buffer_type) {
         case CB_STREAM_RBUF: {
             if (!cb->active_rbuf) return 1;
+            if (whence != CB_SEEK_SET && whence != CB_SEEK_CUR) return 1;
+            // From the oldest byte the history keeps to the end of what is held.
             const cb_off_t held = rb_held(cb->active_rbuf);
-            if (whence == CB_SEEK_SET) return (offset < cur || offset - cur > held) ? 1 : 0;
-            if (whence == CB_SEEK_CUR) return (offset < 0 || offset > held) ? 1 : 0;
-            return 1;
+            const cb_off_t kept = sys_ringbuffer_history(cb->active_rbuf);
+            const cb_off_t delta = whence == CB_SEEK_SET ? offset - cur : offset;
+            return (delta < -kept || delta > held) ? 1 : 0;
         }
         case CB_FS_CACHE: {
             if (whence != CB_SEEK_SET && whence != CB_SEEK_CUR) return 1;
@@ -101,8 +113,7 @@ cb_off_t cb_seek_single64(cb_buffer_st* cb, cb_off_t offset, int whence) {
             } else if (cb->buffer_type == CB_FS_CACHE) {
                 cb->curpos = static_cast<cb_fpos>(offset);
             } else {
-                (void)cb->cb_read(cb, nullptr,
-                                  static_cast<int32_t>(offset - static_cast<cb_off_t>(cb->curpos)));
+                skip_in_ring(cb, offset);
             }
             break;
         case CB_SEEK_CUR:
@@ -116,7 +127,7 @@ cb_off_t cb_seek_single64(cb_buffer_st* cb, cb_off_t offset, int whence) {
             } else if (cb->buffer_type == CB_FS_CACHE) {
                 cb->curpos += static_cast<cb_fpos>(offset);
             } else {
-                (void)cb->cb_read(cb, nullptr, static_cast<int32_t>(offset));
+                skip_in_ring(cb, static_cast<cb_off_t>(cb->curpos) + offset);
             }
             break;
         case CB_SEEK_END:

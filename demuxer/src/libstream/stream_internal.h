@@ -57,6 +57,10 @@ void wait_while_paused(sys_ringbuffer* rb);
 // whether or not a streaming thread runs. Returns the input's answer.
 cb_off_t reposition_ring_input(cb_buffer_st* cb, cb_off_t target, int whence);
 
+// Moves the read position back to `target` when the ring's history still
+// holds the bytes from there; false (nothing changed) otherwise.
+bool rewind_ring(cb_buffer_st* cb, cb_off_t target);
+
 // Starts / stops the streaming thread.
 int OpenStream(cb_buffer_st* cb, const hova_callback_st* cbs);
 void CloseStream(cb_buffer_st* cb, const hova_callback_st* cbs);
