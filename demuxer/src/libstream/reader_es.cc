@@ -30,11 +30,11 @@ void reset_reader_at_input(cb_buffer_st* cb, bool move, int time_ms) {
     }
     cb_io_st* in = cb->input;
     if (move && in->seek_time) (void)in->seek_time(in, time_ms);
+    cb->curpos = static_cast<cb_fpos>(in->tell(in));
     if (cb->fs_cache.buffer) {
-        reset_fs_cache(&cb->fs_cache);
+        reset_fs_cache(cb, cb->curpos);
         cb->buffer_type = CB_FS_CACHE;
     }
-    cb->curpos = static_cast<cb_fpos>(in->tell(in));
 }
 
 }  // namespace
@@ -103,7 +103,7 @@ int cb_set_buffer_mode(cb_buffer_st* cb, int enable) {
         return 0;
     }
     if (cb->fs_cache.buffer) {
-        reset_fs_cache(&cb->fs_cache);
+        reset_fs_cache(cb, static_cast<cb_fpos>(at));
         cb->buffer_type = CB_FS_CACHE;
     }
     return 0;

@@ -45,7 +45,7 @@ int32_t cb_read_single(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
         case CB_FS_CACHE: {
             if (size < 0) size = 0;
             const int32_t n = static_cast<int32_t>(
-                read_fs_cache(cb, &cb->fs_cache, dst, static_cast<size_t>(size), cb->curpos));
+                read_fs_cache(cb, dst, static_cast<size_t>(size), cb->curpos));
             cb->cb_errcode = n < size ? CB_ERR_EOF : CB_ERR_OK;
             cb->curpos += static_cast<cb_fpos>(static_cast<int64_t>(n));
             return n;
@@ -84,9 +84,7 @@ int seek_out_of_buffer(cb_buffer_st* cb, cb_off_t offset, int whence) {
         case CB_FS_CACHE: {
             if (whence != CB_SEEK_SET && whence != CB_SEEK_CUR) return 1;
             const cb_off_t target = whence == CB_SEEK_SET ? offset : cur + offset;
-            const cb_off_t lo = static_cast<cb_off_t>(cb->fs_cache.base_pos);
-            const cb_off_t hi = lo + static_cast<cb_off_t>(cb->fs_cache.avail_size);
-            return (lo <= target && target < hi) ? 0 : 1;
+            return (target >= 0 && cache_holds(cb, static_cast<cb_fpos>(target))) ? 0 : 1;
         }
         default:
             return 1;
@@ -99,7 +97,7 @@ void seek_reset_buffer(cb_buffer_st* cb, cb_off_t pos) {
     if (cb->active_rbuf)
         sys_ringbuffer_reset(cb->active_rbuf);
     else if (cb->fs_cache.buffer)
-        reset_fs_cache(&cb->fs_cache);
+        cache_input_moved(cb, static_cast<cb_fpos>(pos));  // the slots' bytes stay valid
 }
 
 cb_off_t cb_seek_single64(cb_buffer_st* cb, cb_off_t offset, int whence) {
@@ -119,7 +117,10 @@ cb_off_t cb_seek_single64(cb_buffer_st* cb, cb_off_t offset, int whence) {
         case CB_SEEK_CUR:
             if (seek_out_of_buffer(cb, offset, whence)) {
                 if (offset == 0) {
-                    seek_reset_buffer(cb, static_cast<cb_off_t>(cb->curpos));
+                    // The file cache knows where the input stands; the other
+                    // bufferings take it to stand at curpos.
+                    if (cb->buffer_type != CB_FS_CACHE)
+                        seek_reset_buffer(cb, static_cast<cb_off_t>(cb->curpos));
                 } else {
                     r = in->seek(in, static_cast<cb_off_t>(cb->curpos) + offset, CB_SEEK_SET);
                     seek_reset_buffer(cb, r);

@@ -34,10 +34,30 @@ void init_multi_thread_plugin(cb_buffer_st* cb);
 void init_es_plugin(cb_buffer_st* cb);
 void init_thread_plugin(cb_buffer_st* cb, int rbuf_mode);
 
-// File cache.
-void reset_fs_cache(fs_cache_st* c);
-void init_fs_cache(fs_cache_st* c, uint8_t* block, uint32_t len);
-size_t read_fs_cache(cb_buffer_st* cb, fs_cache_st* c, uint8_t* dst, size_t size, cb_fpos pos);
+// File cache: the reader's `base` block holds this record, then the slots.
+constexpr uint32_t CB_CACHE_SLOTS = 3;
+struct cache_slots_st {
+    uint32_t count;    // slots in the block
+    uint32_t active;   // the slot fs_cache describes
+    uint32_t clock;    // use stamps, for picking the slot to refill
+    bool track_input;  // false: the input is moved by others (elementary-stream mode)
+    cb_fpos input_pos; // where the input stands
+    struct {
+        cb_fpos base_pos;
+        uint32_t avail;
+        uint32_t used;
+    } slot[CB_CACHE_SLOTS];
+};
+constexpr size_t CB_CACHE_HEAD = (sizeof(cache_slots_st) + 15) & ~static_cast<size_t>(15);
+// Bytes to allocate for the cache of `block`-byte slots, and how many slots.
+size_t cache_block_bytes(uint32_t block, uint32_t* slots);
+void init_fs_cache(cb_buffer_st* cb, uint32_t len, uint32_t slots, bool track_input);
+// Drops every slot; the input stands at `input_pos`.
+void reset_fs_cache(cb_buffer_st* cb, cb_fpos input_pos);
+// The input was moved to `input_pos`; what the slots hold stays valid.
+void cache_input_moved(cb_buffer_st* cb, cb_fpos input_pos);
+bool cache_holds(const cb_buffer_st* cb, cb_fpos pos);
+size_t read_fs_cache(cb_buffer_st* cb, uint8_t* dst, size_t size, cb_fpos pos);
 int32_t peek_fs_cache(cb_buffer_st* cb, uint8_t* dst, int32_t size);
 
 // Synchronous ring.
