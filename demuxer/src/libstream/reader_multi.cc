@@ -48,6 +48,8 @@ cb_off_t reposition_ring_input(cb_buffer_st* cb, cb_off_t target, int whence) {
     const cb_off_t r = in->seek(in, target, whence);
     if (r != -1) sys_ringbuffer_reset_locked(rb);
     pthread_mutex_unlock(&rb->ring_mutex);
+    // A visit outside the ring ends with any move of the ring.
+    if (r != -1 && cb->base) ring_side(cb)->active = 0;
     return r;
 }
 
@@ -55,6 +57,13 @@ int32_t cb_read_multi(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
     sys_ringbuffer* rb = cb->active_rbuf;
     if (!rb) return cb_read_single(cb, dst, size);
     if (size <= 0) return 0;
+    if (side_active(cb)) {
+        bool more = false;
+        const int32_t n = side_read(cb, dst, size, &more);
+        cb->cb_errcode = n < size ? CB_ERR_EOF : CB_ERR_OK;
+        if (!more) return n;
+        return n + cb_read_multi(cb, dst ? dst + n : nullptr, size - n);
+    }
     // Requests beyond the ring's capacity are served in pieces that fit.
     const int32_t cap = ring_capacity(cb);
     int32_t total = 0;
@@ -78,6 +87,11 @@ int32_t cb_peek_multi(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
     sys_ringbuffer* rb = cb->active_rbuf;
     if (!rb) return cb_peek_single(cb, dst, size);
     if (size <= 0) return 0;
+    if (side_active(cb)) {
+        bool use_ring = false;
+        const int32_t n = side_peek(cb, dst, size, &use_ring);
+        if (!use_ring) return n;
+    }
     // A peek can show at most what the ring can hold.
     if (size > ring_capacity(cb)) size = ring_capacity(cb);
     const int32_t n = sys_ringbuffer_byte_read_peek(rb, dst, size);
@@ -108,20 +122,9 @@ cb_off_t cb_seek_multi64(cb_buffer_st* cb, cb_off_t offset, int whence) {
     }
 
     const cb_off_t cur = static_cast<cb_off_t>(cb->curpos);
-    const cb_off_t held = rb_held(rb);
     const cb_off_t target = whence == CB_SEEK_SET ? offset : cur + offset;
-    if (target >= cur && target - cur <= held) {
-        if (target > cur) (void)cb->cb_read(cb, nullptr, static_cast<int32_t>(target - cur));
-        return static_cast<cb_off_t>(cb->curpos);
-    }
-    if (target < 0) return -1;
-    // Behind the read position, inside what the ring still keeps: read again.
-    if (rewind_ring(cb, target)) return target;
     // A refused move changes nothing: the ring still holds the bytes at curpos.
-    const cb_off_t r = reposition_ring_input(cb, target, CB_SEEK_SET);
-    if (r == -1) return -1;
-    cb->curpos = static_cast<cb_fpos>(r);
-    return r;
+    return ring_seek_to(cb, target);
 }
 
 int32_t cb_seek_multi(cb_buffer_st* cb, int32_t offset, int whence) {

@@ -34,6 +34,13 @@ void WriteData(cb_buffer_st* cb, uint32_t wanted) {
 int32_t read_rbuf_data(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
     sys_ringbuffer* rb = cb->active_rbuf;
     if (size <= 0) return 0;
+    if (side_active(cb)) {
+        bool more = false;
+        const int32_t n = side_read(cb, dst, size, &more);
+        cb->cb_errcode = n < size ? CB_ERR_EOF : CB_ERR_OK;
+        if (!more) return n;
+        return n + read_rbuf_data(cb, dst ? dst + n : nullptr, size - n);
+    }
     int32_t total = 0;
     while (total < size) {
         rb->srlock = 1;
@@ -68,6 +75,11 @@ int32_t read_rbuf_data(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
 int32_t peek_rbuf_data(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
     sys_ringbuffer* rb = cb->active_rbuf;
     if (size <= 0) return 0;
+    if (side_active(cb)) {
+        bool use_ring = false;
+        const int32_t n = side_peek(cb, dst, size, &use_ring);
+        if (!use_ring) return n;
+    }
     rb->srlock = 1;
     WriteData(cb, static_cast<uint32_t>(size));
     const int32_t count = sys_ringbuffer_byte_read_peek_single_thread(rb, dst, size);

@@ -81,6 +81,26 @@ cb_off_t reposition_ring_input(cb_buffer_st* cb, cb_off_t target, int whence);
 // holds the bytes from there; false (nothing changed) otherwise.
 bool rewind_ring(cb_buffer_st* cb, cb_off_t target);
 
+// A short visit outside the ring (reader_side.cc). The record sits in front
+// of the side block in the reader's base block.
+struct ring_side_st {
+    int active;         // curpos is in the side block, not in the ring
+    uint32_t side_len;  // bytes in the side block
+    cb_fpos side_pos;   // input position of its first byte
+    cb_fpos ring_pos;   // the ring's read position while the visit lasts
+};
+ring_side_st* ring_side(const cb_buffer_st* cb);
+bool side_active(const cb_buffer_st* cb);
+// Serves a read from the side block; *more when the rest is to come from the
+// ring (the visit has ended at the block's end).
+int32_t side_read(cb_buffer_st* cb, uint8_t* dst, int32_t size, bool* more);
+// Serves a peek from the side block (read again at curpos when it falls
+// short); *use_ring when the ring now stands at curpos and serves it.
+int32_t side_peek(cb_buffer_st* cb, uint8_t* dst, int32_t size, bool* use_ring);
+// Seek of a ring-buffered reader, either set: inside the ring, its history,
+// the side block, or a visit elsewhere. The new position or -1.
+cb_off_t ring_seek_to(cb_buffer_st* cb, cb_off_t target);
+
 // Starts / stops the streaming thread.
 int OpenStream(cb_buffer_st* cb, const hova_callback_st* cbs);
 void CloseStream(cb_buffer_st* cb, const hova_callback_st* cbs);
