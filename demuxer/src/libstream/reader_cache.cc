@@ -48,16 +48,17 @@ bool find_slot(cb_buffer_st* cb, cb_fpos pos) {
     return false;
 }
 
-// The slot to refill with bytes from `pos`: the one whose bytes end there
-// (its cursor read on), else the one used longest ago.
-void pick_slot_for(cb_buffer_st* cb, cb_fpos pos) {
+// The slot to refill: an empty one, else the one used longest ago. The slot
+// in use is kept while another exists: the other cursor of separate parsing
+// may still be reading it.
+void pick_slot_for(cb_buffer_st* cb) {
     cache_slots_st* s = slots_of(cb);
-    if (cb->fs_cache.base_pos + cb->fs_cache.avail_size == pos || cb->fs_cache.avail_size == 0) return;
+    if (s->count == 1) return;
     uint32_t pick = s->active;
     uint32_t oldest = UINT32_MAX;
     for (uint32_t i = 0; i < s->count; ++i) {
         if (i == s->active) continue;
-        if (s->slot[i].avail == 0 || s->slot[i].base_pos + s->slot[i].avail == pos) {
+        if (s->slot[i].avail == 0) {
             pick = i;
             break;
         }
@@ -67,6 +68,19 @@ void pick_slot_for(cb_buffer_st* cb, cb_fpos pos) {
         }
     }
     if (pick != s->active) use_slot(cb, pick);
+}
+
+// How much of a block from `pos` no other slot holds yet: the refill stops
+// where another slot's bytes begin, so no byte is read twice.
+size_t fresh_bytes_from(const cb_buffer_st* cb, cb_fpos pos) {
+    const cache_slots_st* s = slots_of(cb);
+    size_t n = cb->fs_cache.buffer_length;
+    for (uint32_t i = 0; i < s->count; ++i) {
+        if (i == s->active || s->slot[i].avail == 0) continue;
+        const cb_fpos b = s->slot[i].base_pos;
+        if (b > pos && b - pos < n) n = static_cast<size_t>(b - pos);
+    }
+    return n;
 }
 
 // Puts the input at `pos` unless it stands there already.
@@ -92,6 +106,8 @@ size_t input_read(cb_buffer_st* cb, uint8_t* dst, size_t n) {
 // Copies what the cache holds from `pos` on, up to `size` bytes.
 size_t read_data_from_cache(cb_buffer_st* cb, uint8_t* dst, size_t size, cb_fpos pos) {
     if (size == 0 || !find_slot(cb, pos)) return 0;
+    cache_slots_st* s = slots_of(cb);
+    s->slot[s->active].used = ++s->clock;
     const fs_cache_st* c = &cb->fs_cache;
     const size_t off = static_cast<size_t>(pos - c->base_pos);
     size_t n = c->avail_size - off;
@@ -100,10 +116,12 @@ size_t read_data_from_cache(cb_buffer_st* cb, uint8_t* dst, size_t size, cb_fpos
     return n;
 }
 
-// Serves `r` bytes from the input at `pos`: whole blocks straight into dst,
-// then one refill of a slot for the tail.
-size_t read_data_from_fs(cb_buffer_st* cb, uint8_t* dst, size_t r, cb_fpos pos) {
+// Serves up to `r` bytes from the input at `pos`: whole blocks straight into
+// dst, then one refill of a slot for the tail. *end when the input gave less
+// than was asked.
+size_t read_data_from_fs(cb_buffer_st* cb, uint8_t* dst, size_t r, cb_fpos pos, bool* end) {
     fs_cache_st* c = &cb->fs_cache;
+    *end = true;
     if (!input_at(cb, pos)) return 0;
     const size_t d = (r / c->buffer_length) * c->buffer_length;
     size_t got = 0;
@@ -112,11 +130,13 @@ size_t read_data_from_fs(cb_buffer_st* cb, uint8_t* dst, size_t r, cb_fpos pos) 
         if (k == 0) return got;
         got += k;
     }
-    pick_slot_for(cb, pos + d);
+    pick_slot_for(cb);
     c->avail_size = 0;  // the slot's old bytes are overwritten now
-    const size_t k = input_read(cb, c->buffer, c->buffer_length);
-    c->avail_size = static_cast<uint32_t>(k);
     c->base_pos = pos + d;
+    const size_t want = fresh_bytes_from(cb, pos + d);
+    const size_t k = input_read(cb, c->buffer, want);
+    c->avail_size = static_cast<uint32_t>(k);
+    *end = k < want;
     size_t tail = r - d;
     if (tail > c->avail_size) tail = c->avail_size;
     memcpy(dst + d, c->buffer, tail);
@@ -170,9 +190,21 @@ bool cache_holds(const cb_buffer_st* cb, cb_fpos pos) {
 }
 
 size_t read_fs_cache(cb_buffer_st* cb, uint8_t* dst, size_t size, cb_fpos pos) {
-    const size_t n = read_data_from_cache(cb, dst, size, pos);
-    if (n == size) return n;
-    return n + read_data_from_fs(cb, dst + n, size - n, pos + n);
+    size_t done = 0;
+    for (;;) {
+        // From the slots as far as they go (a read may span two of them).
+        for (;;) {
+            const size_t k = read_data_from_cache(cb, dst + done, size - done, pos + done);
+            done += k;
+            if (k == 0 || done == size) break;
+        }
+        if (done == size) return done;
+        bool end = false;
+        const size_t k = read_data_from_fs(cb, dst + done, size - done, pos + done, &end);
+        done += k;
+        // A refill that stopped at another slot's bytes goes on from there.
+        if (end || k == 0 || done == size) return done;
+    }
 }
 
 int32_t peek_fs_cache(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
@@ -186,27 +218,9 @@ int32_t peek_fs_cache(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
         const cb_off_t r = in->seek(in, static_cast<cb_off_t>(pos), CB_SEEK_SET);
         reset_fs_cache(cb, r == -1 ? static_cast<cb_fpos>(in->tell(in)) : static_cast<cb_fpos>(r));
     } else {
-        const size_t n = read_data_from_cache(cb, dst, static_cast<size_t>(size), pos);
-        count = static_cast<int32_t>(n);
-        if (n < static_cast<size_t>(size)) {
-            // Keep the cached tail, then fill the rest of the block after it,
-            // so the slot afterwards starts at curpos.
-            if (n) {
-                memmove(c->buffer, c->buffer + (pos - c->base_pos), n);
-            } else {
-                pick_slot_for(cb, pos);
-            }
-            c->base_pos = pos;
-            c->avail_size = static_cast<uint32_t>(n);
-            if (input_at(cb, pos + n)) {
-                const size_t k = input_read(cb, c->buffer + n, c->buffer_length - n);
-                c->avail_size = static_cast<uint32_t>(n + k);
-            }
-            size_t total = c->avail_size;
-            if (total > static_cast<size_t>(size)) total = static_cast<size_t>(size);
-            memcpy(dst + n, c->buffer + n, total - n);
-            count = static_cast<int32_t>(total);
-        }
+        // As a read that leaves curpos alone: from the slots, and a refill
+        // where they fall short.
+        count = static_cast<int32_t>(read_fs_cache(cb, dst, static_cast<size_t>(size), pos));
     }
     cb->cb_errcode = count < size ? CB_ERR_EOF : CB_ERR_OK;
     return count;

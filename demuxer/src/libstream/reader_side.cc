@@ -43,6 +43,7 @@ cb_off_t fetch_side(cb_buffer_st* cb, cb_fpos target) {
     }
     pthread_mutex_unlock(&rb->ring_mutex);
     s->active = 1;
+    s->valid = 1;
     s->side_pos = target;
     s->side_len = static_cast<uint32_t>(n);
     cb->curpos = target;
@@ -89,9 +90,12 @@ int32_t side_peek(cb_buffer_st* cb, uint8_t* dst, int32_t size, bool* use_ring) 
     ring_side_st* s = ring_side(cb);
     *use_ring = false;
     const int block = cb->input->block_size;
-    if (cb->curpos + static_cast<uint32_t>(size) > side_end(s)) {
-        if (size > block || s->side_len < static_cast<uint32_t>(block)) {
-            // Larger than a side block, or at the end of the input: from the ring.
+    // A side block shorter than a block ends at the end of the input: a peek
+    // beyond it is short whatever reads it.
+    const bool at_end = block > 0 && s->side_len < static_cast<uint32_t>(block);
+    if (cb->curpos + static_cast<uint32_t>(size) > side_end(s) && !at_end) {
+        if (size > block) {
+            // Larger than a side block: from the ring.
             if (reposition_ring_input(cb, static_cast<cb_off_t>(cb->curpos), CB_SEEK_SET) != -1) {
                 s->active = 0;
                 *use_ring = true;
@@ -114,7 +118,12 @@ cb_off_t ring_seek_to(cb_buffer_st* cb, cb_off_t target) {
     sys_ringbuffer* rb = cb->active_rbuf;
     ring_side_st* s = ring_side(cb);
     const cb_fpos t = static_cast<cb_fpos>(target);
-    if (s->active && t >= s->side_pos && t < side_end(s)) {
+    if (s->valid && t >= s->side_pos && t < side_end(s)) {
+        // Back into the block of an earlier visit: no input.
+        if (!s->active) {
+            s->ring_pos = cb->curpos;
+            s->active = 1;
+        }
         cb->curpos = t;
         return target;
     }
@@ -123,9 +132,11 @@ cb_off_t ring_seek_to(cb_buffer_st* cb, cb_off_t target) {
     const int block = cb->input->block_size;
     // Inside what the ring holds, or close enough behind it that reading on
     // costs less than a visit elsewhere.
-    const uint64_t near = held + static_cast<uint64_t>(block > 0 ? block : 0);
-    const bool threaded = cb->thread_type == CB_MULTI_THREAD;
-    if (t >= rp && (t - rp <= held || (threaded && t - rp <= near))) {
+    // Reading on through the ring up to half its size keeps the bytes in
+    // between for a cursor that is behind (they become history).
+    uint64_t near = held + static_cast<uint64_t>(block > 0 ? block : 0);
+    if (near < (rb->size - 1) / 2) near = (rb->size - 1) / 2;
+    if (t >= rp && t - rp <= near) {
         s->active = 0;
         cb->curpos = rp;
         if (t > rp) (void)cb->cb_read(cb, nullptr, static_cast<int32_t>(t - rp));

@@ -85,6 +85,7 @@ bool rewind_ring(cb_buffer_st* cb, cb_off_t target);
 // of the side block in the reader's base block.
 struct ring_side_st {
     int active;         // curpos is in the side block, not in the ring
+    int valid;          // the side block holds bytes (kept after a visit)
     uint32_t side_len;  // bytes in the side block
     cb_fpos side_pos;   // input position of its first byte
     cb_fpos ring_pos;   // the ring's read position while the visit lasts
