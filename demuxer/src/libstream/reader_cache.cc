@@ -217,10 +217,29 @@ int32_t peek_fs_cache(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
         count = static_cast<int32_t>(read_fs_cache(cb, dst, static_cast<size_t>(size), pos));
         const cb_off_t r = in->seek(in, static_cast<cb_off_t>(pos), CB_SEEK_SET);
         reset_fs_cache(cb, r == -1 ? static_cast<cb_fpos>(in->tell(in)) : static_cast<cb_fpos>(r));
-    } else {
+    } else if (slots_of(cb)->count > 1) {
         // As a read that leaves curpos alone: from the slots, and a refill
         // where they fall short.
         count = static_cast<int32_t>(read_fs_cache(cb, dst, static_cast<size_t>(size), pos));
+    } else {
+        // One slot: keep the cached tail at its start and fill the rest of
+        // the block after it, so the slot starts at curpos and the bytes
+        // peeked are still there for the read that follows.
+        size_t n = read_data_from_cache(cb, dst, static_cast<size_t>(size), pos);
+        count = static_cast<int32_t>(n);
+        if (n < static_cast<size_t>(size)) {
+            if (n) memmove(c->buffer, c->buffer + (pos - c->base_pos), n);
+            c->base_pos = pos;
+            c->avail_size = static_cast<uint32_t>(n);
+            if (input_at(cb, pos + n)) {
+                const size_t k = input_read(cb, c->buffer + n, c->buffer_length - n);
+                c->avail_size = static_cast<uint32_t>(n + k);
+            }
+            size_t total = c->avail_size;
+            if (total > static_cast<size_t>(size)) total = static_cast<size_t>(size);
+            memcpy(dst + n, c->buffer + n, total - n);
+            count = static_cast<int32_t>(total);
+        }
     }
     cb->cb_errcode = count < size ? CB_ERR_EOF : CB_ERR_OK;
     return count;
