@@ -1,13 +1,16 @@
 // Seek cost: 200 random seeks, each followed by delivery of the video key
-// frame found, over files held in memory and read in 4 KiB blocks: the large
-// ffmpeg WMV and the corpus files that carry a simple index, each with its
-// index and with the index hidden (the copy cut after the data object).
-// Per seek: time, input read and seek calls and bytes read, for the seek
-// alone and for the seek plus the first key frame; beside libavformat's
-// av_seek_frame plus av_read_frame up to the first video key frame on the same
-// bytes (its index loaded by a first seek, as ours has its start offset).
+// frame found, over files held in memory and read in 32 KiB blocks (1 MiB
+// ring): the large ffmpeg WMV and the corpus files that carry a simple index,
+// each with its index and with the index hidden (the copy cut after the data
+// object). Per seek: time, input read and seek calls and bytes read, for the
+// seek alone and for the seek plus the first key frame, with the file cache;
+// the seek plus first key frame again in each of the four buffering modes
+// (with the most memory the plug-in held); beside libavformat's av_seek_frame
+// plus av_read_frame up to the first video key frame on the same bytes (its
+// index loaded by a first seek, as ours has its start offset). A markdown
+// table of the per-mode figures ends the run.
 //
-// usage: seek_bench [--corpus DIR] [--cache DIR] [--big FILE] [--seeks N]
+// usage: seek_bench [--corpus DIR] [--cache DIR] [--big FILE] [--seeks N] [--block-size N]
 #include <algorithm>
 #include <chrono>
 #include <cstdint>
@@ -36,8 +39,21 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 using Bytes = std::vector<uint8_t>;
-constexpr int kBlock = 4096;
+int g_block = 32768;
+constexpr int kRing = 1 << 20;
 constexpr int kPasses = 3;
+
+enum class Mode { Cache, None, Ring, Thread };
+constexpr Mode kModes[] = {Mode::Cache, Mode::None, Mode::Ring, Mode::Thread};
+const char* mode_name(Mode m) {
+    switch (m) {
+        case Mode::Cache: return "cache";
+        case Mode::None: return "none";
+        case Mode::Ring: return "ring";
+        case Mode::Thread: return "thread";
+    }
+    return "?";
+}
 
 bool read_file(const std::string& path, Bytes* out) {
     FILE* f = std::fopen(path.c_str(), "rb");
@@ -70,6 +86,7 @@ struct Figures {
     int done = 0, failed = 0;
     double us = 0;  // per seek (and first frame), best pass
     double reads = 0, seeks = 0, kb = 0;
+    size_t peak = 0;  // most bytes the plug-in held from the host
 };
 
 void print(const char* who, const std::string& what, const char* part, const Figures& f) {
@@ -84,17 +101,21 @@ void print(const char* who, const std::string& what, const char* part, const Fig
 // ---- the plug-in ----
 
 // `deliver`: after each seek, get_data until the video frame at the time found.
-Figures plugin_seeks(const Bytes& file, const std::vector<int64_t>& targets, int dir, bool deliver) {
+Figures plugin_seeks(const Bytes& file, const std::vector<int64_t>& targets, int dir, bool deliver,
+                     Mode mode = Mode::Cache) {
     Figures out;
     out.us = 1e300;
     for (int pass = 0; pass < kPasses; ++pass) {
         LeanHost host;
         host::InputOptions in;
-        in.block_size = kBlock;
+        in.block_size = g_block;
+        in.disable_cache = mode == Mode::None;
+        in.rbuf_mode = (mode == Mode::Ring || mode == Mode::Thread) ? CBIO_APPLY_RBUF : CBIO_NO_RBUF;
+        in.use_thread = mode == Mode::Thread;
         auto input = host::RawInput::borrow_memory(file.data(), file.size(), in);
         host::ContextBuffer buf(static_cast<size_t>(hova_asff_demuxer.min_context_size));
         void* ctx = nullptr;
-        if (hova_asff_demuxer.open_file(&ctx, input->io(), buf.data(), static_cast<int>(buf.size()), 1 << 20,
+        if (hova_asff_demuxer.open_file(&ctx, input->io(), buf.data(), static_cast<int>(buf.size()), kRing,
                                         host.table()) != HOVA_OK)
             return out;
         hova_stream_type_et t = HOVA_STREAM_NONE;
@@ -125,6 +146,7 @@ Figures plugin_seeks(const Bytes& file, const std::vector<int64_t>& targets, int
         const double us = std::chrono::duration<double, std::micro>(Clock::now() - t0).count();
         const host::InputCounters& after = input->counters();
         hova_asff_demuxer.close_file(ctx);
+        out.peak = std::max(out.peak, host.peak_bytes);
         const double n = static_cast<double>(targets.size());
         out.ok = true;
         out.done = done;
@@ -176,8 +198,8 @@ Figures libav_seeks(const Bytes& file, const std::vector<int64_t>& targets, bool
     out.us = 1e300;
     for (int pass = 0; pass < kPasses; ++pass) {
         MemIO mem{&file};
-        auto* iobuf = static_cast<uint8_t*>(av_malloc(kBlock));
-        AVIOContext* avio = avio_alloc_context(iobuf, kBlock, 0, &mem, mem_read, nullptr, mem_seek);
+        auto* iobuf = static_cast<uint8_t*>(av_malloc(static_cast<size_t>(g_block)));
+        AVIOContext* avio = avio_alloc_context(iobuf, g_block, 0, &mem, mem_read, nullptr, mem_seek);
         AVFormatContext* fmt = avformat_alloc_context();
         fmt->pb = avio;
         bool opened = avformat_open_input(&fmt, nullptr, nullptr, nullptr) == 0;
@@ -244,6 +266,14 @@ bool describe(const Bytes& file, int64_t* duration, bool* indexed) {
     return true;
 }
 
+// The closing markdown table: per file and variant, seek plus first key frame.
+struct Summary {
+    std::string what;
+    Figures modes[4];
+    Figures lavf;
+};
+std::vector<Summary> g_summary;
+
 void run_file(const std::string& name, const Bytes& file, int count) {
     int64_t duration = 0;
     bool indexed = false;
@@ -260,14 +290,37 @@ void run_file(const std::string& name, const Bytes& file, int count) {
         const Figures ours = plugin_seeks(*bytes, targets, HOVA_SEEK_BACKWARD, true);
         print("plimo", what, "seek+keyframe", ours);
         print("plimo", what, "fwd+keyframe", plugin_seeks(*bytes, targets, HOVA_SEEK_FORWARD, true));
+        Summary sum;
+        sum.what = what;
+        for (Mode m : kModes) {
+            const Figures f = m == Mode::Cache ? ours : plugin_seeks(*bytes, targets, HOVA_SEEK_BACKWARD, true, m);
+            sum.modes[static_cast<int>(m)] = f;
+            const std::string part = std::string("+key ") + mode_name(m);
+            print("plimo", what, part.c_str(), f);
+            if (f.ok) std::printf("%-10s %-46s %-14s %8.1f KB peak memory\n", "", "", "", static_cast<double>(f.peak) / 1024.0);
+        }
 #ifdef PLIMO_HAVE_LIBAV
         print("lavf", what, "seek", libav_seeks(*bytes, targets, false));
         const Figures theirs = libav_seeks(*bytes, targets, true);
+        sum.lavf = theirs;
         print("lavf", what, "seek+keyframe", theirs);
         if (ours.ok && theirs.ok && ours.kb > 0)
             std::printf("%-10s %-46s %-14s time x%.2f, bytes x%.2f (lavf / plimo)\n", "ratio", what.c_str(),
                         "seek+keyframe", theirs.us / ours.us, theirs.kb / ours.kb);
 #endif
+        g_summary.push_back(sum);
+    }
+}
+
+void print_summary() {
+    std::printf("\n| File | libavformat us / KB | cache us / KB | none us / KB | ring us / KB | thread us / KB | "
+                "peak KB cache / none / ring / thread |\n|---|---|---|---|---|---|---|\n");
+    for (const Summary& s : g_summary) {
+        std::printf("| %s | %.1f / %.1f", s.what.c_str(), s.lavf.us, s.lavf.kb);
+        for (const Figures& f : s.modes) std::printf(" | %.1f / %.1f", f.us, f.kb);
+        std::printf(" | %.0f / %.1f / %.0f / %.0f |\n", static_cast<double>(s.modes[0].peak) / 1024.0,
+                    static_cast<double>(s.modes[1].peak) / 1024.0, static_cast<double>(s.modes[2].peak) / 1024.0,
+                    static_cast<double>(s.modes[3].peak) / 1024.0);
     }
 }
 
@@ -308,8 +361,9 @@ int main(int argc, char** argv) {
         else if (i + 1 < argc && a == "--cache") cache = argv[++i];
         else if (i + 1 < argc && a == "--big") big = argv[++i];
         else if (i + 1 < argc && a == "--seeks") count = std::atoi(argv[++i]);
+        else if (i + 1 < argc && a == "--block-size") g_block = std::atoi(argv[++i]);
         else {
-            std::fprintf(stderr, "usage: %s [--corpus DIR] [--cache DIR] [--big FILE] [--seeks N]\n", argv[0]);
+            std::fprintf(stderr, "usage: %s [--corpus DIR] [--cache DIR] [--big FILE] [--seeks N] [--block-size N]\n", argv[0]);
             return 2;
         }
     }
@@ -317,12 +371,14 @@ int main(int argc, char** argv) {
 #ifdef PLIMO_HAVE_LIBAV
     av_log_set_level(AV_LOG_QUIET);
 #endif
-    std::printf("%d random backward seeks per file, %d-byte input blocks, from memory\n", count, kBlock);
+    std::printf("%d random backward seeks per file, %d-byte input blocks, %d-byte ring, from memory\n", count,
+                g_block, kRing);
     if (big.empty()) big = plimo_bench::big_file(cache);
     Bytes file;
     if (!big.empty() && read_file(big, &file)) run_file("big.wmv", file, count);
     else std::fprintf(stderr, "no large file (ffmpeg missing?); skipped\n");
     for (const std::string& path : corpus_files(corpus))
         if (read_file(path, &file)) run_file(path.substr(path.find_last_of('/') + 1), file, count);
+    print_summary();
     return 0;
 }

@@ -186,6 +186,10 @@ int RawInput::op_seek_time(cb_io_st* io, int time) {
     RawInput* in = of(io);
     in->counters_.seek_time_calls++;
     in->counters_.seek_times.push_back(time);
+    if (in->time_to_position) {
+        const int64_t to = in->time_to_position(time);
+        if (to >= 0) in->pos_ = static_cast<uint64_t>(to);
+    }
     return in->seek_time_result;
 }
 

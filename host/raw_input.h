@@ -85,6 +85,10 @@ public:
 
     // Host-side answers for the optional operations.
     int seek_time_result = 0;
+    // When set, seek_time moves the input to the position it returns for the
+    // time (in ms; -1 for a flush), as a host's own time seek would; a
+    // negative answer leaves the input where it is.
+    std::function<int64_t(int time_ms)> time_to_position;
     int open_done_result = 0;
     // Without it the io's seek_time slot is null, as some hosts leave it.
     void set_seek_time_available(bool on);

@@ -15,15 +15,27 @@ class LeanHost {
 public:
     LeanHost() {
         table_.notify = [](void*, hova_stream_type_et, hova_event_et) { return 0; };
-        table_.malloc = [](void* c, size_t n) {
-            self(c)->blocks++;
-            return std::malloc(n ? n : 1);
+        // Each block carries its size in front so that the peak of what the
+        // plug-in holds can be reported.
+        table_.malloc = [](void* c, size_t n) -> void* {
+            LeanHost* h = self(c);
+            auto* p = static_cast<size_t*>(std::malloc(n + kHead));
+            if (!p) return nullptr;
+            *p = n;
+            h->blocks++;
+            h->bytes += n;
+            h->peak_bytes = std::max(h->peak_bytes, h->bytes);
+            return reinterpret_cast<uint8_t*>(p) + kHead;
         };
         table_.realloc = [](void*, void*, size_t) -> void* { return nullptr; };
         table_.freep = [](void* c, void* pp) {
             void** p = static_cast<void**>(pp);
-            if (*p) self(c)->blocks--;
-            std::free(*p);
+            if (*p) {
+                auto* head = reinterpret_cast<size_t*>(static_cast<uint8_t*>(*p) - kHead);
+                self(c)->blocks--;
+                self(c)->bytes -= *head;
+                std::free(head);
+            }
             *p = nullptr;
         };
         table_.get_time = [](void*) -> int64_t { return 0; };
@@ -56,10 +68,13 @@ public:
     const hova_callback_st* table() const { return &table_; }
     uint64_t commits = 0;
     int blocks = 0;
+    size_t bytes = 0;       // held by the plug-in now
+    size_t peak_bytes = 0;  // most it held at once
     hova_stream_type_et last_type = HOVA_STREAM_NONE;
     int64_t last_pts = -1;
 
 private:
+    static constexpr size_t kHead = 16;  // keeps the blocks 16-byte aligned
     static LeanHost* self(void* c) { return static_cast<LeanHost*>(c); }
     int frame(hova_stream_type_et t, void** b, int n) {
         Frame& f = frames_[t & 15];

@@ -264,3 +264,48 @@ TEST(Ring, ReadConsumesWhatItCopies) {
     EXPECT_EQ(sys_ringbuffer_byte_read(&r.rb, nullptr, 4), 1) << "skips what is held";
     EXPECT_EQ(sys_ringbuffer_empty(&r.rb), 1);
 }
+
+TEST(Ring, HistoryGivesBackReleasedBytesUntilTheProducerNeedsTheirRoom) {
+    // Ring of 16 (15 usable). Each step: (write n | release n | in-place n),
+    // then the history and whether a rewind of `back` bytes gives exactly
+    // the bytes released last.
+    Ring r(16);
+    uint8_t next = 1;  // value of the next byte produced
+    auto produce = [&](uint32_t n, bool in_place) {
+        if (in_place) {
+            while (n) {
+                pthread_mutex_lock(&r.rb.ring_mutex);
+                uint8_t* at = nullptr;
+                const uint32_t room = sys_ringbuffer_wspace_locked(&r.rb, n, &at);
+                for (uint32_t i = 0; i < room; ++i) at[i] = next++;
+                sys_ringbuffer_commit_locked(&r.rb, room);
+                pthread_mutex_unlock(&r.rb.ring_mutex);
+                ASSERT_GT(room, 0u);
+                n -= room;
+            }
+        } else {
+            r.write(seq(next, n));
+            next = static_cast<uint8_t>(next + n);
+        }
+    };
+    produce(10, false);  // bytes 1..10
+    sys_ringbuffer_byte_release(&r.rb, 8);
+    EXPECT_EQ(sys_ringbuffer_history(&r.rb), 8u);
+    EXPECT_EQ(sys_ringbuffer_rewind(&r.rb, 9), 0) << "more than was released";
+    ASSERT_EQ(sys_ringbuffer_rewind(&r.rb, 3), 1);
+    EXPECT_EQ(r.peek(5), seq(6, 5)) << "bytes 6..10 are read again";
+    EXPECT_EQ(sys_ringbuffer_history(&r.rb), 5u);
+    sys_ringbuffer_byte_release(&r.rb, 5);  // 10 released in all, history 10
+    // 15 - 0 held = 15 free; producing 8 leaves room for 7 of the history.
+    produce(8, true);  // wraps the storage: bytes 11..18 in two pieces
+    EXPECT_EQ(sys_ringbuffer_history(&r.rb), 7u);
+    ASSERT_EQ(sys_ringbuffer_rewind(&r.rb, 7), 1);
+    EXPECT_EQ(r.peek(15), seq(4, 15)) << "bytes 4..10 from the history, 11..18 new";
+    sys_ringbuffer_byte_release(&r.rb, 15);
+    produce(15, false);
+    EXPECT_EQ(sys_ringbuffer_history(&r.rb), 0u) << "a full ring keeps nothing behind";
+    EXPECT_EQ(sys_ringbuffer_rewind(&r.rb, 1), 0);
+    sys_ringbuffer_byte_release(&r.rb, 4);
+    sys_ringbuffer_reset(&r.rb);
+    EXPECT_EQ(sys_ringbuffer_history(&r.rb), 0u) << "a reset forgets the history";
+}

@@ -52,7 +52,7 @@ TEST(ReaderWait, SeekInARingWithoutThreadStopsWaitingAndMovesTheInput) {
     const auto t0 = Clock::now();
     EXPECT_EQ(r.seek(500, CB_SEEK_SET), 500);
     EXPECT_GE(seconds_since(t0), 8.9);
-    EXPECT_EQ(r.in_->counters().seeks, 1u);
+    EXPECT_EQ(r.in_->counters().seeks, 2u) << "a block read there, the input put back";
     // The caller's thread can then read it through the synchronous ring.
     changeThreadType(&r.cb_, 0);
     EXPECT_EQ(r.read_vec(100), r.slice(500, 100));

@@ -138,3 +138,40 @@ TEST(ReaderEquivalence, SeeksNeverLetStaleOrMissingBlocksThrough) {
     }
     EXPECT_GT(out_of_buffer, 1000);
 }
+
+TEST(ReaderEquivalence, TwoCursorsReadEachByteOnce) {
+    // Separate parsing: one cursor for audio, one for video, read in turns
+    // about a block apart (the file cache's slots) or far apart (the ring's
+    // history). Every mode returns the file's bytes at each
+    // cursor, and no byte comes from the input twice.
+    const struct {
+        Mode mode;
+        size_t gap;
+    } cases[] = {
+        {Mode::Cache, 3000}, {Mode::Cache, 5000},   {Mode::SyncRing, 3000},
+        {Mode::SyncRing, 14000}, {Mode::Thread, 3000}, {Mode::Thread, 14000},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(testing::Message() << mode_name(c.mode) << " gap " << c.gap);
+        constexpr size_t kSize = 120000;
+        Reader r(pattern(kSize, 11), options_for(c.mode, 4096, 32768));
+        ASSERT_EQ(r.open(c.mode), 0);
+        uint64_t at[2] = {0, c.gap};
+        uint8_t buf[700];
+        std::mt19937 rng(c.gap);
+        while (at[1] < kSize) {
+            // Both cursors move by the same amount, so the gap stays.
+            const int32_t n = 1 + static_cast<int32_t>(rng() % 700);
+            for (uint64_t& pos : at) {
+                ASSERT_EQ(r.seek(static_cast<cb_off_t>(pos), CB_SEEK_SET), static_cast<cb_off_t>(pos));
+                uint8_t head[40];
+                const int32_t p = r.peek(head, 40);
+                ASSERT_EQ(std::vector<uint8_t>(head, head + p), r.slice(pos, 40));
+                const int32_t got = r.read(buf, n);
+                ASSERT_EQ(std::vector<uint8_t>(buf, buf + got), r.slice(pos, static_cast<size_t>(n)));
+                pos += static_cast<uint64_t>(got);
+            }
+        }
+        EXPECT_LE(r.in_->counters().bytes_read, kSize + 4096) << "a block at most beyond the end";
+    }
+}

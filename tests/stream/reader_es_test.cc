@@ -1,5 +1,8 @@
 // Elementary-stream mode, adopting the input's position, switching buffering
 // off and on, and the status table.
+#include <atomic>
+#include <thread>
+
 #include "es_source.h"
 #include "reader_fixture.h"
 #include "stream_internal.h"
@@ -116,32 +119,93 @@ TEST(ReaderBufferMode, ThreadReaderResumesAtThePositionAfterSwitching) {
     }
 }
 
-TEST(ReaderResetCache, AdoptsTheInputPosition) {
-    for (Mode m : {Mode::None, Mode::Cache, Mode::SyncRing}) {
-        SCOPED_TRACE(mode_name(m));
-        Reader r(pattern(5000), options_for(m, 256, 1024));
-        ASSERT_EQ(r.open(m), 0);
-        r.read_vec(10);
-        // The host moves the input by itself (by time, say).
-        r.in_->io()->seek(r.in_->io(), 3000, CB_SEEK_SET);
-        cb_reset_cache(&r.cb_);
-        EXPECT_EQ(cb_tell64(&r.cb_), 3000u);
-        EXPECT_EQ(r.cb_.buffer_type,
-                  m == Mode::None ? CB_NO_BUF : m == Mode::Cache ? CB_FS_CACHE : CB_STREAM_RBUF);
-        EXPECT_EQ(r.read_vec(100), r.slice(3000, 100));
+TEST(ReaderResetCache, AdoptsTheInputPositionInEveryMode) {
+    // The host moves its input by itself (by time); reset, flush and the
+    // time move then take the reader there, the streaming thread running.
+    enum class Op { Reset, Flush, TimeMove };
+    for (Mode m : {Mode::None, Mode::Cache, Mode::SyncRing, Mode::Thread}) {
+        for (Op op : {Op::Reset, Op::Flush, Op::TimeMove}) {
+            SCOPED_TRACE(testing::Message() << mode_name(m) << " op " << static_cast<int>(op));
+            Reader r(pattern(50000), options_for(m, 256, 1024));
+            r.in_->time_to_position = [](int ms) -> int64_t { return ms == -1 ? 41000 : ms * 10; };
+            ASSERT_EQ(r.open(m), 0);
+            EXPECT_EQ(r.read_vec(10), r.slice(0, 10));
+            uint64_t want = 0;
+            switch (op) {
+                case Op::Reset:
+                    if (m == Mode::Thread) continue;  // only the reader may move a threaded input
+                    r.in_->io()->seek(r.in_->io(), 3000, CB_SEEK_SET);
+                    cb_reset_cache(&r.cb_);
+                    want = 3000;
+                    break;
+                case Op::Flush:
+                    cb_flush_data(&r.cb_);
+                    want = 41000;
+                    break;
+                case Op::TimeMove:
+                    cb_seek_time_reset(&r.cb_, 1234);
+                    want = 12340;
+                    break;
+            }
+            EXPECT_EQ(cb_tell64(&r.cb_), want);
+            EXPECT_EQ(r.cb_.buffer_type,
+                      m == Mode::None ? CB_NO_BUF : m == Mode::Cache ? CB_FS_CACHE : CB_STREAM_RBUF);
+            EXPECT_EQ(r.read_vec(3000), r.slice(want, 3000));
+        }
     }
 }
 
-TEST(ReaderResetCache, FlushAsksTheHostFirstWhenItCan) {
+TEST(ReaderResetCache, WithoutTheHostsTimeMoveTheReaderTakesTheInputWhereItStands) {
     for (bool available : {true, false}) {
         Reader r(pattern(5000), options_for(Mode::Cache, 256, 1024));
         r.in_->set_seek_time_available(available);
         ASSERT_EQ(r.open(), 0);
         r.read_vec(10);
         cb_flush_data(&r.cb_);
-        EXPECT_EQ(r.in_->counters().seek_times, available ? std::vector<int>{-1} : std::vector<int>{});
+        cb_seek_time_reset(&r.cb_, 77);
+        EXPECT_EQ(r.in_->counters().seek_times, available ? (std::vector<int>{-1, 77}) : std::vector<int>{});
         EXPECT_EQ(cb_tell64(&r.cb_), 256u) << "the input stood behind the cache";
         EXPECT_EQ(r.read_vec(10), r.slice(256, 10));
+    }
+}
+
+TEST(ReaderResetCache, TimeMovesWhileTheThreadReadsLoseNothing) {
+    // The host's time seek and the reader's reset are one step for the
+    // streaming thread: after each, the reader returns exactly the input's
+    // bytes from the new position, whatever the thread was doing. Tiny blocks
+    // and an input that naps now and then put the move in every phase of the
+    // thread's loop.
+    constexpr size_t kSize = 1 << 17;
+    Reader r(pattern(kSize, 7), options_for(Mode::Thread, 41, 41 * 3 + 3));
+    std::atomic<uint32_t> tick{0};
+    r.in_->faults().before_read = [&](uint64_t, size_t) {
+        const uint32_t t = tick.fetch_add(1);
+        if (t % 5 == 0) std::this_thread::yield();
+        if (t % 89 == 0) std::this_thread::sleep_for(std::chrono::microseconds(30));
+    };
+    r.in_->time_to_position = [](int ms) -> int64_t { return ms; };
+    ASSERT_EQ(r.open(), 0);
+    std::mt19937 rng(3);
+    uint8_t buf[200];
+    for (int i = 0; i < 3000; ++i) {
+        const int ms = static_cast<int>(rng() % kSize);
+        if (rng() % 2) {
+            cb_seek_time_reset(&r.cb_, ms);
+        } else {
+            // A flush: the host puts its input where it likes.
+            r.in_->time_to_position = [ms](int) -> int64_t { return ms; };
+            cb_flush_data(&r.cb_);
+            r.in_->time_to_position = [](int t) -> int64_t { return t; };
+        }
+        ASSERT_EQ(cb_tell64(&r.cb_), static_cast<uint64_t>(ms)) << "step " << i;
+        uint64_t pos = static_cast<uint64_t>(ms);
+        for (int k = 0; k < 3; ++k) {
+            const int32_t n = 1 + static_cast<int32_t>(rng() % 200);
+            const int32_t got = r.read(buf, n);
+            ASSERT_EQ(std::vector<uint8_t>(buf, buf + got), r.slice(pos, static_cast<size_t>(n)))
+                << "at " << pos << " step " << i;
+            pos += static_cast<uint64_t>(got);
+        }
     }
 }
 

@@ -27,9 +27,10 @@ TEST(ReaderSingle, SeekOriginsAndFailures) {
         EXPECT_EQ(cb_seek_single(&r.cb_, 300, CB_SEEK_SET), 300);
         EXPECT_EQ(r.read_vec(3), r.slice(300, 3));
 
-        // A refused seek leaves the reader where the input really is.
+        // A refused seek (to bytes no cache slot holds) leaves the reader
+        // where the input really is.
         r.in_->faults().refuse_seek = true;
-        EXPECT_EQ(r.seek(0, CB_SEEK_SET), -1);
+        EXPECT_EQ(r.seek(700, CB_SEEK_SET), -1);
         EXPECT_EQ(cb_tell64(&r.cb_), r.in_->position());
         r.in_->faults().refuse_seek = false;
         const uint64_t at = cb_tell64(&r.cb_);
@@ -199,24 +200,30 @@ TEST(ReaderCache, EndOfInputGivesShortCountsAndEof) {
     }
 }
 
-TEST(ReaderCache, PeekKeepsPositionAndStartsTheCacheThere) {
+TEST(ReaderCache, PeekKeepsPositionAndFillsAnotherSlot) {
     Reader r(pattern(20000), cached(4096));
     ASSERT_EQ(r.open(), 0);
-    r.read_vec(4000);  // cache 0..4096, position 4000
+    r.read_vec(4000);  // a slot holds 0..4096, position 4000
     uint8_t p[4096];
     ASSERT_EQ(r.peek(p, 300), 300);
     EXPECT_EQ(std::vector<uint8_t>(p, p + 300), r.slice(4000, 300));
     EXPECT_EQ(cb_tell64(&r.cb_), 4000u);
-    EXPECT_EQ(r.cb_.fs_cache.base_pos, 4000u);
+    // The bytes behind 4096 came into a slot of their own; the first stays.
+    EXPECT_EQ(r.cb_.fs_cache.base_pos, 4096u);
     EXPECT_EQ(r.cb_.fs_cache.avail_size, 4096u);
-    EXPECT_EQ(r.in_->position(), 8096u);
+    EXPECT_EQ(r.in_->position(), 8192u);
     const uint64_t reads = r.in_->counters().reads;
-    EXPECT_EQ(r.read_vec(300), r.slice(4000, 300));
+    EXPECT_EQ(r.read_vec(300), r.slice(4000, 300)) << "across both slots";
     EXPECT_EQ(r.in_->counters().reads, reads);
-    // A peek of exactly one block is still served through the cache.
+    EXPECT_EQ(r.seek(0, CB_SEEK_SET), 0);
+    EXPECT_EQ(r.read_vec(100), r.slice(0, 100));
+    EXPECT_EQ(r.in_->counters().reads, reads) << "the first slot is still there";
+    // A peek of exactly one block: the input, read where the slots end.
+    EXPECT_EQ(r.seek(4300, CB_SEEK_SET), 4300);
     ASSERT_EQ(r.peek(p, 4096), 4096);
     EXPECT_EQ(std::vector<uint8_t>(p, p + 4096), r.slice(4300, 4096));
-    EXPECT_EQ(r.cb_.fs_cache.base_pos, 4300u);
+    EXPECT_EQ(cb_tell64(&r.cb_), 4300u);
+    EXPECT_EQ(r.read_vec(4096), r.slice(4300, 4096));
 }
 
 TEST(ReaderCache, LargePeekLeavesTheInputAtThePositionWithAnEmptyCache) {

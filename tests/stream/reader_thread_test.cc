@@ -8,14 +8,6 @@
 
 using namespace readertest;
 
-namespace {
-
-void wait_for_held(cb_buffer_st* cb, int32_t n) {
-    while (sys_ringbuffer_avail(cb->srbuf) < n) sched_yield();
-}
-
-}  // namespace
-
 TEST(ReaderThread, ReadingToTheEndThenPastIt) {
     Reader r(pattern(10000), options_for(Mode::Thread, 512, 4096));
     ASSERT_EQ(r.open(), 0);
@@ -33,7 +25,8 @@ TEST(ReaderThread, ForwardSeekInsideTheRingOnlySkips) {
     Reader r(pattern(100000), options_for(Mode::Thread, 256, 4096));
     ASSERT_EQ(r.open(), 0);
     EXPECT_EQ(r.read_vec(100), r.slice(0, 100));
-    wait_for_held(&r.cb_, 2000);
+    uint8_t ahead[2000];
+    ASSERT_EQ(r.peek(ahead, 2000), 2000);  // the ring now holds them
     const uint64_t seeks = r.in_->counters().seeks;
     EXPECT_EQ(r.seek(1500, CB_SEEK_SET), 1500);
     EXPECT_EQ(r.seek(400, CB_SEEK_CUR), 1900);
@@ -43,39 +36,50 @@ TEST(ReaderThread, ForwardSeekInsideTheRingOnlySkips) {
     EXPECT_EQ(r.seek(0, 9), -1);
 }
 
-TEST(ReaderThread, SeekOutsideTheRingMovesTheInputOnce) {
+TEST(ReaderThread, SeeksMoveTheInputOnlyOutsideWhatTheRingKeeps) {
+    // The ring keeps released bytes (its history) until the thread needs
+    // their room: a seek back into them reads them again without the input.
+    // Elsewhere a seek reads one block there and puts the input back (two
+    // input seeks); reading on past that block moves the ring there.
     const struct {
         const char* what;
+        size_t read_first;
         cb_off_t off;
         int whence;
         uint64_t target;
+        bool moves;
     } cases[] = {
-        {"backward", 10, CB_SEEK_SET, 10},
-        {"backward by offset", -50, CB_SEEK_CUR, 50},
-        {"far forward", 70000, CB_SEEK_SET, 70000},
-        {"past the end", 200000, CB_SEEK_SET, 200000},
+        {"back into the history", 100, 10, CB_SEEK_SET, 10, false},
+        {"back by offset into the history", 100, -50, CB_SEEK_CUR, 50, false},
+        {"back to the first byte kept", 1500, -1, CB_SEEK_CUR, 1499, false},
+        {"back beyond the history", 6000, 10, CB_SEEK_SET, 10, true},
+        {"far forward", 100, 70000, CB_SEEK_SET, 70000, true},
+        {"past the end", 100, 200000, CB_SEEK_SET, 200000, true},
     };
     for (const auto& c : cases) {
         SCOPED_TRACE(c.what);
         Reader r(pattern(100000), options_for(Mode::Thread, 256, 2048));
         ASSERT_EQ(r.open(), 0);
-        r.read_vec(100);
+        ASSERT_EQ(r.read_vec(static_cast<int32_t>(c.read_first)), r.slice(0, c.read_first));
         const uint64_t seeks = r.in_->counters().seeks;
         EXPECT_EQ(r.seek(c.off, c.whence), static_cast<cb_off_t>(c.target));
-        EXPECT_EQ(r.in_->counters().seeks, seeks + 1);
-        EXPECT_EQ(r.read_vec(300), r.slice(c.target, 300));
-        EXPECT_EQ(cb_tell64(&r.cb_), std::min<uint64_t>(c.target + 300, std::max<uint64_t>(c.target, 100000)));
+        EXPECT_EQ(r.in_->counters().seeks, seeks + (c.moves ? 2 : 0));
+        EXPECT_EQ(r.read_vec(3000), r.slice(c.target, 3000));
+        if (c.moves && c.target < 100000) {
+            EXPECT_EQ(r.in_->counters().seeks, seeks + 3) << "the ring moved once";
+        }
+        EXPECT_EQ(cb_tell64(&r.cb_), std::min<uint64_t>(c.target + 3000, std::max<uint64_t>(c.target, 100000)));
     }
 }
 
 TEST(ReaderThread, RefusedSeekKeepsTheBufferedBytes) {
     Reader r(pattern(100000), options_for(Mode::Thread, 256, 2048));
     ASSERT_EQ(r.open(), 0);
-    r.read_vec(100);
+    r.read_vec(6000);
     r.in_->faults().refuse_seek = true;
     EXPECT_EQ(r.seek(0, CB_SEEK_SET), -1);
-    EXPECT_EQ(cb_tell64(&r.cb_), 100u);
-    EXPECT_EQ(r.read_vec(3000), r.slice(100, 3000));
+    EXPECT_EQ(cb_tell64(&r.cb_), 6000u);
+    EXPECT_EQ(r.read_vec(3000), r.slice(6000, 3000));
 }
 
 TEST(ReaderThread, PeekShowsTheNextReadAndIsBoundedByTheRing) {
@@ -113,17 +117,26 @@ TEST(ReaderSyncRing, ReadsPeeksAndSeeksOnTheCallersThread) {
     uint8_t p[600];
     EXPECT_EQ(r.peek(p, 600), 600);
     EXPECT_EQ(std::vector<uint8_t>(p, p + 600), r.slice(100, 600));
-    // Inside what the ring holds a forward seek consumes; outside it moves the input.
+    // Inside what the ring holds a forward seek consumes, and the consumed
+    // bytes stay readable as history; beyond both it moves the input.
     const uint64_t seeks = r.in_->counters().seeks;
     EXPECT_EQ(r.seek(700, CB_SEEK_SET), 700);
     EXPECT_EQ(r.in_->counters().seeks, seeks);
-    EXPECT_EQ(seek_out_of_buffer(&r.cb_, 699, CB_SEEK_SET), 1);
+    const cb_off_t kept = sys_ringbuffer_history(r.cb_.srbuf);
+    ASSERT_GT(kept, 600);
+    EXPECT_EQ(seek_out_of_buffer(&r.cb_, 700 - kept, CB_SEEK_SET), 0);
+    EXPECT_EQ(seek_out_of_buffer(&r.cb_, 699 - kept, CB_SEEK_SET), 1);
     EXPECT_EQ(seek_out_of_buffer(&r.cb_, 700 + r.cb_.srbuf->pkt_cnt, CB_SEEK_SET), 0);
     EXPECT_EQ(seek_out_of_buffer(&r.cb_, 701 + r.cb_.srbuf->pkt_cnt, CB_SEEK_SET), 1);
-    EXPECT_EQ(seek_out_of_buffer(&r.cb_, -1, CB_SEEK_CUR), 1);
+    EXPECT_EQ(seek_out_of_buffer(&r.cb_, -kept, CB_SEEK_CUR), 0);
+    EXPECT_EQ(seek_out_of_buffer(&r.cb_, -kept - 1, CB_SEEK_CUR), 1);
     EXPECT_EQ(seek_out_of_buffer(&r.cb_, r.cb_.srbuf->pkt_cnt, CB_SEEK_CUR), 0);
+    EXPECT_EQ(r.seek(700 - kept, CB_SEEK_SET), 700 - kept);
+    EXPECT_EQ(r.in_->counters().seeks, seeks) << "read again from the history";
+    EXPECT_EQ(r.read_vec(1000), r.slice(static_cast<size_t>(700 - kept), 1000));
+    r.read_vec(2500);  // byte 3 leaves the history
     EXPECT_EQ(r.seek(3, CB_SEEK_SET), 3);
-    EXPECT_EQ(r.in_->counters().seeks, seeks + 1);
+    EXPECT_EQ(r.in_->counters().seeks, seeks + 2) << "a block read there, the input put back";
     EXPECT_EQ(r.read_vec(3000), r.slice(3, 3000));
     // More than the input still holds: the rest, then the end.
     EXPECT_EQ(r.read_vec(4000), r.slice(3003, 4000));

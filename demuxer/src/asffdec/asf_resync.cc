@@ -23,8 +23,8 @@ extern "C" int asf_resync_time(void* ctx, int64_t resync_time) {
     // A packet abandoned earlier would send delivery back to its position by
     // number; the input's new position is the one to read from.
     d->resync = 0;
-    cb_io_st* in = cb->input;
-    if (in && in->seek_time) (void)in->seek_time(in, static_cast<int>(resync_time / 1000));
-    cb_reset_cache(cb);
+    // The input moves by time and the reader adopts its position as one
+    // step, so that a streaming thread cannot read in between.
+    cb_seek_time_reset(cb, static_cast<int>(resync_time / 1000));
     return HOVA_OK;
 }

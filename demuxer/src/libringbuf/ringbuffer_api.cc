@@ -29,6 +29,12 @@ inline int16_t load_eos(const sys_ringbuffer* rb) {
     return __atomic_load_n(&rb->buf_eos, __ATOMIC_ACQUIRE);
 }
 
+// Bytes just written took room that the history may have counted on.
+void trim_history(sys_ringbuffer* rb) {
+    const uint32_t room = static_cast<uint32_t>(sys_ringbuffer_free_internal(rb));
+    if (rb->hist > room) rb->hist = room;
+}
+
 void copy_in(sys_ringbuffer* rb, const uint8_t* src, uint32_t len) {
     const uint32_t tail = rb->size - rb->pwrite;
     if (len > tail) {
@@ -68,6 +74,9 @@ void sys_ringbuffer_init(sys_ringbuffer* rb, uint8_t* data, uint32_t len) {
     rb->wlock = 0;
     __atomic_store_n(&rb->slock, 0, __ATOMIC_RELAXED);
     rb->srlock = 0;
+    rb->hist = 0;
+    rb->taken = 0;
+    rb->retry_read = 0;
     pthread_mutex_init(&rb->ring_mutex, nullptr);
     pthread_cond_init(&rb->ring_avail_cond, nullptr);
     pthread_cond_init(&rb->ring_free_cond, nullptr);
@@ -85,6 +94,7 @@ void sys_ringbuffer_close(sys_ringbuffer* rb) {
     store_cnt(rb, 0);
     rb->pread = rb->pwrite;
     rb->error = 0;
+    rb->hist = 0;
     pthread_cond_signal(&rb->ring_avail_cond);
     pthread_cond_signal(&rb->ring_free_cond);
     pthread_mutex_unlock(&rb->ring_mutex);
@@ -113,6 +123,7 @@ void sys_ringbuffer_flush(sys_ringbuffer* rb) {
     store_cnt(rb, 0);
     rb->error = 1;
     rb->pread = rb->pwrite;
+    rb->hist = 0;
     pthread_cond_signal(&rb->ring_avail_cond);
     pthread_cond_signal(&rb->ring_free_cond);
     pthread_mutex_unlock(&rb->ring_mutex);
@@ -122,6 +133,8 @@ void sys_ringbuffer_reset_locked(sys_ringbuffer* rb) {
     store_cnt(rb, 0);
     rb->pread = 0;
     rb->pwrite = 0;
+    rb->hist = 0;
+    rb->taken = 0;
     store_eos(rb, 0);
     __atomic_store_n(&rb->slock, 0, __ATOMIC_RELAXED);
     pthread_cond_signal(&rb->ring_avail_cond);
@@ -180,6 +193,8 @@ uint32_t wait_and_copy_locked(sys_ringbuffer* rb, uint8_t* dst, int32_t len) {
     rb->rsize_req = len;
     rb->srlock = 1;
     int32_t avail = sys_ringbuffer_avail_internal(rb);
+    // A producer holding back its read-ahead must know that the consumer waits.
+    if (avail < len && rb->wsize_req != 0) pthread_cond_signal(&rb->ring_free_cond);
     while (avail < len && !load_eos(rb)) {
         if (rb_cond_timed_wait(&rb->ring_avail_cond, &rb->ring_mutex) != 0) break;
         avail = sys_ringbuffer_avail_internal(rb);
@@ -196,6 +211,10 @@ void release_locked(sys_ringbuffer* rb, uint32_t len) {
     if (p >= rb->size) p -= rb->size;
     rb->pread = p;
     store_cnt(rb, load_cnt(rb) - len);
+    // Released bytes stay readable until the producer needs their room.
+    rb->hist += len;
+    trim_history(rb);
+    rb->taken = rb->taken > UINT32_MAX - len ? UINT32_MAX : rb->taken + len;
     if (rb->wsize_req != 0 && sys_ringbuffer_free_internal(rb) >= rb->wsize_req)
         pthread_cond_signal(&rb->ring_free_cond);
     rb->srlock = 0;
@@ -238,6 +257,7 @@ int32_t sys_ringbuffer_byte_write(sys_ringbuffer* rb, const uint8_t* src, uint32
     if (!rb->rlock) {
         copy_in(rb, src, len);
         store_cnt(rb, load_cnt(rb) + len);
+        trim_history(rb);
     }
     // Stored or dropped, the producer's block is no longer in flight.
     rb->rlock = 0;
@@ -259,6 +279,7 @@ int32_t sys_ringbuffer_byte_write2(sys_ringbuffer* rb, uint32_t len) {
             rb->pwrite += len;
             if (rb->pwrite == rb->size) rb->pwrite = 0;
         }
+        trim_history(rb);
     }
     // Stored or dropped, the producer's block is no longer in flight.
     rb->rlock = 0;
@@ -266,4 +287,43 @@ int32_t sys_ringbuffer_byte_write2(sys_ringbuffer* rb, uint32_t len) {
     if (rb->rsize_req != 0) pthread_cond_signal(&rb->ring_avail_cond);
     pthread_mutex_unlock(&rb->ring_mutex);
     return static_cast<int32_t>(len);
+}
+
+uint32_t sys_ringbuffer_wspace_locked(sys_ringbuffer* rb, uint32_t len, uint8_t** at) {
+    uint32_t room = static_cast<uint32_t>(sys_ringbuffer_free_internal(rb));
+    const uint32_t to_end = rb->size - rb->pwrite;
+    if (room > to_end) room = to_end;
+    if (room > len) room = len;
+    *at = rb->data + rb->pwrite;
+    // The history must not count bytes the producer is about to overwrite.
+    const uint32_t left = static_cast<uint32_t>(sys_ringbuffer_free_internal(rb)) - room;
+    if (rb->hist > left) rb->hist = left;
+    return room;
+}
+
+void sys_ringbuffer_commit_locked(sys_ringbuffer* rb, uint32_t len) {
+    rb->pwrite += len;
+    if (rb->pwrite == rb->size) rb->pwrite = 0;
+    store_cnt(rb, load_cnt(rb) + len);
+    trim_history(rb);
+    if (rb->rsize_req != 0) pthread_cond_signal(&rb->ring_avail_cond);
+}
+
+int sys_ringbuffer_rewind(sys_ringbuffer* rb, uint32_t len) {
+    pthread_mutex_lock(&rb->ring_mutex);
+    const bool held = len <= rb->hist;
+    if (held) {
+        rb->pread = rb->pread >= len ? rb->pread - len : rb->pread + rb->size - len;
+        store_cnt(rb, load_cnt(rb) + len);
+        rb->hist -= len;
+    }
+    pthread_mutex_unlock(&rb->ring_mutex);
+    return held ? 1 : 0;
+}
+
+uint32_t sys_ringbuffer_history(sys_ringbuffer* rb) {
+    pthread_mutex_lock(&rb->ring_mutex);
+    const uint32_t h = rb->hist;
+    pthread_mutex_unlock(&rb->ring_mutex);
+    return h;
 }

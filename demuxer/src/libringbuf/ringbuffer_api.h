@@ -28,6 +28,13 @@ struct sys_ringbuffer {
     int8_t wlock;            /* the producer holds a block not yet stored */
     volatile int8_t slock;   /* readers pause while set */
     int8_t srlock;           /* a consumer is between read-peek and release */
+    uint32_t hist;           /* released bytes just behind pread that are still
+                                intact: a consumer may take them back (rewind)
+                                until the producer needs their room */
+    uint32_t taken;          /* bytes released since the last reset (saturates);
+                                the streaming thread reads ahead in step with it */
+    int8_t retry_read;       /* the streaming thread's next read follows a wait
+                                at the end of the input */
     rb_mutex_t ring_mutex;
     rb_cond_t ring_avail_cond;
     rb_cond_t ring_free_cond;
@@ -61,6 +68,12 @@ int32_t sys_ringbuffer_byte_read_peek_single_thread(sys_ringbuffer* rb, uint8_t*
 int32_t sys_ringbuffer_byte_write(sys_ringbuffer* rb, const uint8_t* src, uint32_t len);
 int32_t sys_ringbuffer_byte_write2(sys_ringbuffer* rb, uint32_t len);
 
+/* Takes back `len` released bytes (they are read again next); 1 when the
+ * history still holds them, else 0 and nothing changes. */
+int sys_ringbuffer_rewind(sys_ringbuffer* rb, uint32_t len);
+/* Released bytes that can still be taken back. */
+uint32_t sys_ringbuffer_history(sys_ringbuffer* rb);
+
 /* Both writes clear rlock and wlock: the producer's block is then stored or
  * dropped, no longer in flight. */
 
@@ -68,5 +81,10 @@ int32_t sys_ringbuffer_byte_write2(sys_ringbuffer* rb, uint32_t len);
 void sys_ringbuffer_reset_locked(sys_ringbuffer* rb);
 int32_t sys_ringbuffer_free_internal(const sys_ringbuffer* rb);
 int32_t sys_ringbuffer_avail_internal(const sys_ringbuffer* rb);
+/* In-place production without a staging copy: the free bytes that follow
+ * pwrite without wrapping (at most `len`), at *at; then commit what was put
+ * there. The history gives up the room the producer takes. */
+uint32_t sys_ringbuffer_wspace_locked(sys_ringbuffer* rb, uint32_t len, uint8_t** at);
+void sys_ringbuffer_commit_locked(sys_ringbuffer* rb, uint32_t len);
 
 #endif /* SYS_RINGBUFFER_API_H */

@@ -8,33 +8,34 @@ es_cbio_st* source_of(const cb_buffer_st* cb) { return static_cast<es_cbio_st*>(
 
 bool es_mode(const cb_buffer_st* cb) { return cb->input->rbuf_mode == CBIO_APPLY_ES_BUF; }
 
-// Empties the ring and adopts the input's position in one critical section,
-// so that a streaming thread's block read before this point is dropped and
-// none read after it is lost.
-void reset_ring_at_input(cb_buffer_st* cb, bool ask_host_flush) {
+// Has the host move its input by time (when asked and when it can), adopts
+// the input's position and empties the ring, all in one critical section: the
+// streaming thread reads the input only under this lock, so no block read
+// from the old position survives and none read from the new one is lost.
+void reset_ring_at_input(cb_buffer_st* cb, bool move, int time_ms) {
     sys_ringbuffer* rb = cb->active_rbuf;
     cb_io_st* in = cb->input;
     pthread_mutex_lock(&rb->ring_mutex);
-    if (ask_host_flush && in->seek_time) (void)in->seek_time(in, -1);
+    if (move && in->seek_time) (void)in->seek_time(in, time_ms);
     cb->curpos = static_cast<cb_fpos>(in->tell(in));
-    if (rb->wlock) rb->rlock = 1;
     sys_ringbuffer_reset_locked(rb);
     pthread_mutex_unlock(&rb->ring_mutex);
+    if (cb->base) ring_side(cb)->active = ring_side(cb)->valid = 0;
 }
 
-void reset_reader_at_input(cb_buffer_st* cb, bool ask_host_flush) {
+void reset_reader_at_input(cb_buffer_st* cb, bool move, int time_ms) {
     if (cb->active_rbuf) {
         cb->buffer_type = CB_STREAM_RBUF;
-        reset_ring_at_input(cb, ask_host_flush);
+        reset_ring_at_input(cb, move, time_ms);
         return;
     }
     cb_io_st* in = cb->input;
-    if (ask_host_flush && in->seek_time) (void)in->seek_time(in, -1);
+    if (move && in->seek_time) (void)in->seek_time(in, time_ms);
+    cb->curpos = static_cast<cb_fpos>(in->tell(in));
     if (cb->fs_cache.buffer) {
-        reset_fs_cache(&cb->fs_cache);
+        reset_fs_cache(cb, cb->curpos);
         cb->buffer_type = CB_FS_CACHE;
     }
-    cb->curpos = static_cast<cb_fpos>(in->tell(in));
 }
 
 }  // namespace
@@ -76,9 +77,11 @@ void cb_flush_es_data(cb_buffer_st* cb, es_data_type_et type) {
     if (src->flush) src->flush(src, type);
 }
 
-void cb_reset_cache(cb_buffer_st* cb) { reset_reader_at_input(cb, false); }
+void cb_reset_cache(cb_buffer_st* cb) { reset_reader_at_input(cb, false, 0); }
 
-void cb_flush_data(cb_buffer_st* cb) { reset_reader_at_input(cb, true); }
+void cb_flush_data(cb_buffer_st* cb) { reset_reader_at_input(cb, true, -1); }
+
+void cb_seek_time_reset(cb_buffer_st* cb, int time_ms) { reset_reader_at_input(cb, true, time_ms); }
 
 int cb_set_buffer_mode(cb_buffer_st* cb, int enable) {
     if (es_mode(cb)) {
@@ -101,7 +104,7 @@ int cb_set_buffer_mode(cb_buffer_st* cb, int enable) {
         return 0;
     }
     if (cb->fs_cache.buffer) {
-        reset_fs_cache(&cb->fs_cache);
+        reset_fs_cache(cb, static_cast<cb_fpos>(at));
         cb->buffer_type = CB_FS_CACHE;
     }
     return 0;

@@ -22,6 +22,14 @@ bool ring_has_thread(const cb_buffer_st* cb) { return cb->thread_type == CB_MULT
 
 }  // namespace
 
+bool rewind_ring(cb_buffer_st* cb, cb_off_t target) {
+    const cb_off_t cur = static_cast<cb_off_t>(cb->curpos);
+    if (target >= cur || cur - target > static_cast<cb_off_t>(UINT32_MAX)) return false;
+    if (!sys_ringbuffer_rewind(cb->active_rbuf, static_cast<uint32_t>(cur - target))) return false;
+    cb->curpos = static_cast<cb_fpos>(target);
+    return true;
+}
+
 void init_multi_thread_plugin(cb_buffer_st* cb) {
     cb->cb_read = cb_read_multi;
     cb->cb_peek = cb_peek_multi;
@@ -33,17 +41,15 @@ cb_off_t reposition_ring_input(cb_buffer_st* cb, cb_off_t target, int whence) {
     sys_ringbuffer* rb = cb->active_rbuf;
     cb_io_st* in = cb->input;
     // One critical section for the input move and the emptying of the ring:
-    // the thread reads the input only under this lock, so every block it
-    // reads is either wholly before this point or wholly after it. A block
-    // read before and not yet stored (wlock) is dropped by the ring when the
-    // thread stores it (rlock).
+    // the thread reads the input and stores what it read only under this
+    // lock, so every block is either wholly before this point (and emptied
+    // here) or wholly after it.
     pthread_mutex_lock(&rb->ring_mutex);
     const cb_off_t r = in->seek(in, target, whence);
-    if (r != -1) {
-        if (rb->wlock) rb->rlock = 1;
-        sys_ringbuffer_reset_locked(rb);
-    }
+    if (r != -1) sys_ringbuffer_reset_locked(rb);
     pthread_mutex_unlock(&rb->ring_mutex);
+    // A visit outside the ring ends with any move of the ring.
+    if (r != -1 && cb->base) ring_side(cb)->active = 0;
     return r;
 }
 
@@ -51,6 +57,13 @@ int32_t cb_read_multi(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
     sys_ringbuffer* rb = cb->active_rbuf;
     if (!rb) return cb_read_single(cb, dst, size);
     if (size <= 0) return 0;
+    if (side_active(cb)) {
+        bool more = false;
+        const int32_t n = side_read(cb, dst, size, &more);
+        cb->cb_errcode = n < size ? CB_ERR_EOF : CB_ERR_OK;
+        if (!more) return n;
+        return n + cb_read_multi(cb, dst ? dst + n : nullptr, size - n);
+    }
     // Requests beyond the ring's capacity are served in pieces that fit.
     const int32_t cap = ring_capacity(cb);
     int32_t total = 0;
@@ -74,6 +87,11 @@ int32_t cb_peek_multi(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
     sys_ringbuffer* rb = cb->active_rbuf;
     if (!rb) return cb_peek_single(cb, dst, size);
     if (size <= 0) return 0;
+    if (side_active(cb)) {
+        bool use_ring = false;
+        const int32_t n = side_peek(cb, dst, size, &use_ring);
+        if (!use_ring) return n;
+    }
     // A peek can show at most what the ring can hold.
     if (size > ring_capacity(cb)) size = ring_capacity(cb);
     const int32_t n = sys_ringbuffer_byte_read_peek(rb, dst, size);
@@ -104,18 +122,9 @@ cb_off_t cb_seek_multi64(cb_buffer_st* cb, cb_off_t offset, int whence) {
     }
 
     const cb_off_t cur = static_cast<cb_off_t>(cb->curpos);
-    const cb_off_t held = rb_held(rb);
     const cb_off_t target = whence == CB_SEEK_SET ? offset : cur + offset;
-    if (target >= cur && target - cur <= held) {
-        if (target > cur) (void)cb->cb_read(cb, nullptr, static_cast<int32_t>(target - cur));
-        return static_cast<cb_off_t>(cb->curpos);
-    }
-    if (target < 0) return -1;
     // A refused move changes nothing: the ring still holds the bytes at curpos.
-    const cb_off_t r = reposition_ring_input(cb, target, CB_SEEK_SET);
-    if (r == -1) return -1;
-    cb->curpos = static_cast<cb_fpos>(r);
-    return r;
+    return ring_seek_to(cb, target);
 }
 
 int32_t cb_seek_multi(cb_buffer_st* cb, int32_t offset, int whence) {

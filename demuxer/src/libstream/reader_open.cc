@@ -52,7 +52,23 @@ int OpenURL(cb_buffer_st* cbuf, cb_io_st* input, int ringbuf_size, const hova_ca
     } else {
         cbuf->buffer_type = ring_wanted ? CB_STREAM_RBUF : CB_FS_CACHE;
         const uint32_t block = static_cast<uint32_t>(input->block_size);
-        cbuf->base = static_cast<uint8_t*>(host_alloc(cbs, block));
+        // The file cache keeps a block per cursor (a few slots behind a small
+        // record); a ring reads in place and uses the block for visits
+        // outside it (reader_side.cc).
+        const bool es = input->rbuf_mode == CBIO_APPLY_ES_BUF;
+        uint32_t slots = 1;
+        size_t base_bytes = CB_CACHE_HEAD + block;  // a ring's side block
+        if (!ring_wanted) {
+            base_bytes = cache_block_bytes(block, &slots);
+            // Elementary-stream mode moves the input behind the reader's back:
+            // one slot, read where the input stands.
+            if (es) {
+                slots = 1;
+                base_bytes = CB_CACHE_HEAD + block;
+            }
+        }
+        cbuf->base = static_cast<uint8_t*>(host_alloc(cbs, base_bytes));
+        if (cbuf->base) memset(cbuf->base, 0, CB_CACHE_HEAD);
         bool ok = cbuf->base != nullptr;
         if (ok && ring_wanted) {
             cbuf->stream_ringbuf =
@@ -72,7 +88,7 @@ int OpenURL(cb_buffer_st* cbuf, cb_io_st* input, int ringbuf_size, const hova_ca
                 cbuf->active_rbuf = cbuf->srbuf;
             }
         } else if (ok) {
-            init_fs_cache(&cbuf->fs_cache, cbuf->base, block);
+            init_fs_cache(cbuf, block, slots, !es);
         }
         if (!ok) {
             SYS_LOG("reader: out of memory opening the input\n");

@@ -12,22 +12,35 @@ void wait_while_paused(sys_ringbuffer* rb) {
 void WriteData(cb_buffer_st* cb, uint32_t wanted) {
     sys_ringbuffer* rb = cb->active_rbuf;
     if (rb_held(rb) >= wanted || rb_eos(rb)) return;
+    // Straight from the input into the ring's free space, a block (or what
+    // is left before the storage wraps) at a time.
+    pthread_mutex_lock(&rb->ring_mutex);
     for (;;) {
         const int block = cb->input->block_size;
-        if (sys_ringbuffer_free(rb) < block) return;
-        const size_t n = cb->input->read(cb->input, cb->base, static_cast<size_t>(block));
+        if (block <= 0 || sys_ringbuffer_free_internal(rb) < block) break;
+        uint8_t* at = nullptr;
+        const uint32_t room = sys_ringbuffer_wspace_locked(rb, static_cast<uint32_t>(block), &at);
+        const size_t n = cb->input->read(cb->input, at, room);
         if (n == 0) {
             rb_set_eos(rb, 1);
-            return;
+            break;
         }
-        sys_ringbuffer_byte_write(rb, cb->base, static_cast<uint32_t>(n));
-        if (rb_held(rb) >= wanted || rb_eos(rb)) return;
+        sys_ringbuffer_commit_locked(rb, static_cast<uint32_t>(n));
+        if (rb_held(rb) >= wanted) break;
     }
+    pthread_mutex_unlock(&rb->ring_mutex);
 }
 
 int32_t read_rbuf_data(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
     sys_ringbuffer* rb = cb->active_rbuf;
     if (size <= 0) return 0;
+    if (side_active(cb)) {
+        bool more = false;
+        const int32_t n = side_read(cb, dst, size, &more);
+        cb->cb_errcode = n < size ? CB_ERR_EOF : CB_ERR_OK;
+        if (!more) return n;
+        return n + read_rbuf_data(cb, dst ? dst + n : nullptr, size - n);
+    }
     int32_t total = 0;
     while (total < size) {
         rb->srlock = 1;
@@ -62,6 +75,11 @@ int32_t read_rbuf_data(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
 int32_t peek_rbuf_data(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
     sys_ringbuffer* rb = cb->active_rbuf;
     if (size <= 0) return 0;
+    if (side_active(cb)) {
+        bool use_ring = false;
+        const int32_t n = side_peek(cb, dst, size, &use_ring);
+        if (!use_ring) return n;
+    }
     rb->srlock = 1;
     WriteData(cb, static_cast<uint32_t>(size));
     const int32_t count = sys_ringbuffer_byte_read_peek_single_thread(rb, dst, size);

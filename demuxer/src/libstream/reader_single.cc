@@ -19,6 +19,16 @@ int32_t read_direct(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
     return n;
 }
 
+// Inside the ring's held bytes or its history: forward consumes, backward
+// takes released bytes back.
+void skip_in_ring(cb_buffer_st* cb, cb_off_t target) {
+    const cb_off_t cur = static_cast<cb_off_t>(cb->curpos);
+    if (target > cur)
+        (void)cb->cb_read(cb, nullptr, static_cast<int32_t>(target - cur));
+    else if (target < cur)
+        (void)rewind_ring(cb, target);
+}
+
 }  // namespace
 
 void init_single_thread_plugin(cb_buffer_st* cb) {
@@ -35,7 +45,7 @@ int32_t cb_read_single(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
         case CB_FS_CACHE: {
             if (size < 0) size = 0;
             const int32_t n = static_cast<int32_t>(
-                read_fs_cache(cb, &cb->fs_cache, dst, static_cast<size_t>(size), cb->curpos));
+                read_fs_cache(cb, dst, static_cast<size_t>(size), cb->curpos));
             cb->cb_errcode = n < size ? CB_ERR_EOF : CB_ERR_OK;
             cb->curpos += static_cast<cb_fpos>(static_cast<int64_t>(n));
             return n;
@@ -64,17 +74,17 @@ int seek_out_of_buffer(cb_buffer_st* cb, cb_off_t offset, int whence) {
     switch (cb->buffer_type) {
         case CB_STREAM_RBUF: {
             if (!cb->active_rbuf) return 1;
+            if (whence != CB_SEEK_SET && whence != CB_SEEK_CUR) return 1;
+            // From the oldest byte the history keeps to the end of what is held.
             const cb_off_t held = rb_held(cb->active_rbuf);
-            if (whence == CB_SEEK_SET) return (offset < cur || offset - cur > held) ? 1 : 0;
-            if (whence == CB_SEEK_CUR) return (offset < 0 || offset > held) ? 1 : 0;
-            return 1;
+            const cb_off_t kept = sys_ringbuffer_history(cb->active_rbuf);
+            const cb_off_t delta = whence == CB_SEEK_SET ? offset - cur : offset;
+            return (delta < -kept || delta > held) ? 1 : 0;
         }
         case CB_FS_CACHE: {
             if (whence != CB_SEEK_SET && whence != CB_SEEK_CUR) return 1;
             const cb_off_t target = whence == CB_SEEK_SET ? offset : cur + offset;
-            const cb_off_t lo = static_cast<cb_off_t>(cb->fs_cache.base_pos);
-            const cb_off_t hi = lo + static_cast<cb_off_t>(cb->fs_cache.avail_size);
-            return (lo <= target && target < hi) ? 0 : 1;
+            return (target >= 0 && cache_holds(cb, static_cast<cb_fpos>(target))) ? 0 : 1;
         }
         default:
             return 1;
@@ -84,15 +94,22 @@ int seek_out_of_buffer(cb_buffer_st* cb, cb_off_t offset, int whence) {
 void seek_reset_buffer(cb_buffer_st* cb, cb_off_t pos) {
     if (pos == -1) pos = cb->input->tell(cb->input);
     cb->curpos = static_cast<cb_fpos>(pos);
-    if (cb->active_rbuf)
+    if (cb->active_rbuf) {
         sys_ringbuffer_reset(cb->active_rbuf);
+        if (cb->base) ring_side(cb)->active = 0;
+    }
     else if (cb->fs_cache.buffer)
-        reset_fs_cache(&cb->fs_cache);
+        cache_input_moved(cb, static_cast<cb_fpos>(pos));  // the slots' bytes stay valid
 }
 
 cb_off_t cb_seek_single64(cb_buffer_st* cb, cb_off_t offset, int whence) {
     cb_io_st* in = cb->input;
     cb_off_t r = 0;
+    if (cb->buffer_type == CB_STREAM_RBUF && cb->active_rbuf && cb->base &&
+        (whence == CB_SEEK_SET || whence == CB_SEEK_CUR)) {
+        const cb_off_t target = whence == CB_SEEK_SET ? offset : static_cast<cb_off_t>(cb->curpos) + offset;
+        return ring_seek_to(cb, target);
+    }
     switch (whence) {
         case CB_SEEK_SET:
             if (seek_out_of_buffer(cb, offset, whence)) {
@@ -101,14 +118,16 @@ cb_off_t cb_seek_single64(cb_buffer_st* cb, cb_off_t offset, int whence) {
             } else if (cb->buffer_type == CB_FS_CACHE) {
                 cb->curpos = static_cast<cb_fpos>(offset);
             } else {
-                (void)cb->cb_read(cb, nullptr,
-                                  static_cast<int32_t>(offset - static_cast<cb_off_t>(cb->curpos)));
+                skip_in_ring(cb, offset);
             }
             break;
         case CB_SEEK_CUR:
             if (seek_out_of_buffer(cb, offset, whence)) {
                 if (offset == 0) {
-                    seek_reset_buffer(cb, static_cast<cb_off_t>(cb->curpos));
+                    // The file cache knows where the input stands; the other
+                    // bufferings take it to stand at curpos.
+                    if (cb->buffer_type != CB_FS_CACHE)
+                        seek_reset_buffer(cb, static_cast<cb_off_t>(cb->curpos));
                 } else {
                     r = in->seek(in, static_cast<cb_off_t>(cb->curpos) + offset, CB_SEEK_SET);
                     seek_reset_buffer(cb, r);
@@ -116,7 +135,7 @@ cb_off_t cb_seek_single64(cb_buffer_st* cb, cb_off_t offset, int whence) {
             } else if (cb->buffer_type == CB_FS_CACHE) {
                 cb->curpos += static_cast<cb_fpos>(offset);
             } else {
-                (void)cb->cb_read(cb, nullptr, static_cast<int32_t>(offset));
+                skip_in_ring(cb, static_cast<cb_off_t>(cb->curpos) + offset);
             }
             break;
         case CB_SEEK_END:

@@ -34,10 +34,30 @@ void init_multi_thread_plugin(cb_buffer_st* cb);
 void init_es_plugin(cb_buffer_st* cb);
 void init_thread_plugin(cb_buffer_st* cb, int rbuf_mode);
 
-// File cache.
-void reset_fs_cache(fs_cache_st* c);
-void init_fs_cache(fs_cache_st* c, uint8_t* block, uint32_t len);
-size_t read_fs_cache(cb_buffer_st* cb, fs_cache_st* c, uint8_t* dst, size_t size, cb_fpos pos);
+// File cache: the reader's `base` block holds this record, then the slots.
+constexpr uint32_t CB_CACHE_SLOTS = 3;
+struct cache_slots_st {
+    uint32_t count;    // slots in the block
+    uint32_t active;   // the slot fs_cache describes
+    uint32_t clock;    // use stamps, for picking the slot to refill
+    bool track_input;  // false: the input is moved by others (elementary-stream mode)
+    cb_fpos input_pos; // where the input stands
+    struct {
+        cb_fpos base_pos;
+        uint32_t avail;
+        uint32_t used;
+    } slot[CB_CACHE_SLOTS];
+};
+constexpr size_t CB_CACHE_HEAD = (sizeof(cache_slots_st) + 15) & ~static_cast<size_t>(15);
+// Bytes to allocate for the cache of `block`-byte slots, and how many slots.
+size_t cache_block_bytes(uint32_t block, uint32_t* slots);
+void init_fs_cache(cb_buffer_st* cb, uint32_t len, uint32_t slots, bool track_input);
+// Drops every slot; the input stands at `input_pos`.
+void reset_fs_cache(cb_buffer_st* cb, cb_fpos input_pos);
+// The input was moved to `input_pos`; what the slots hold stays valid.
+void cache_input_moved(cb_buffer_st* cb, cb_fpos input_pos);
+bool cache_holds(const cb_buffer_st* cb, cb_fpos pos);
+size_t read_fs_cache(cb_buffer_st* cb, uint8_t* dst, size_t size, cb_fpos pos);
 int32_t peek_fs_cache(cb_buffer_st* cb, uint8_t* dst, int32_t size);
 
 // Synchronous ring.
@@ -56,6 +76,31 @@ void wait_while_paused(sys_ringbuffer* rb);
 // holds nothing read before the move and receives every block read after it,
 // whether or not a streaming thread runs. Returns the input's answer.
 cb_off_t reposition_ring_input(cb_buffer_st* cb, cb_off_t target, int whence);
+
+// Moves the read position back to `target` when the ring's history still
+// holds the bytes from there; false (nothing changed) otherwise.
+bool rewind_ring(cb_buffer_st* cb, cb_off_t target);
+
+// A short visit outside the ring (reader_side.cc). The record sits in front
+// of the side block in the reader's base block.
+struct ring_side_st {
+    int active;         // curpos is in the side block, not in the ring
+    int valid;          // the side block holds bytes (kept after a visit)
+    uint32_t side_len;  // bytes in the side block
+    cb_fpos side_pos;   // input position of its first byte
+    cb_fpos ring_pos;   // the ring's read position while the visit lasts
+};
+ring_side_st* ring_side(const cb_buffer_st* cb);
+bool side_active(const cb_buffer_st* cb);
+// Serves a read from the side block; *more when the rest is to come from the
+// ring (the visit has ended at the block's end).
+int32_t side_read(cb_buffer_st* cb, uint8_t* dst, int32_t size, bool* more);
+// Serves a peek from the side block (read again at curpos when it falls
+// short); *use_ring when the ring now stands at curpos and serves it.
+int32_t side_peek(cb_buffer_st* cb, uint8_t* dst, int32_t size, bool* use_ring);
+// Seek of a ring-buffered reader, either set: inside the ring, its history,
+// the side block, or a visit elsewhere. The new position or -1.
+cb_off_t ring_seek_to(cb_buffer_st* cb, cb_off_t target);
 
 // Starts / stops the streaming thread.
 int OpenStream(cb_buffer_st* cb, const hova_callback_st* cbs);

@@ -1,54 +1,104 @@
-// The streaming thread: reads the input in block_size pieces ahead of the
-// parser and appends them to the ring.
-#include <unistd.h>
+// The streaming thread: reads the input ahead of the parser, straight into
+// the ring's free space, and waits on the ring's conditions (never polls)
+// while there is nothing to do.
+#include <time.h>
 
 #include "dprintf.h"
 #include "streaming_app.h"
 #include "stream_internal.h"
 
+namespace {
+
+// At the end of the input the thread waits for a seek or the close; an input
+// that grows is read again after this long.
+constexpr long kEndOfInputRetryNs = 10L * 1000 * 1000;
+
+void wait_for_wake(sys_ringbuffer* rb, long ns) {
+    struct timespec deadline;
+    clock_gettime(CLOCK_REALTIME, &deadline);
+    deadline.tv_nsec += ns;
+    while (deadline.tv_nsec >= 1000000000L) {
+        deadline.tv_sec += 1;
+        deadline.tv_nsec -= 1000000000L;
+    }
+    (void)pthread_cond_timedwait(&rb->ring_free_cond, &rb->ring_mutex, &deadline);
+}
+
+void wait_for_wake(sys_ringbuffer* rb) {
+    struct timespec deadline;
+    deadline.tv_sec = time(nullptr) + SYS_RINGBUFFER_WAIT_S;
+    deadline.tv_nsec = 0;
+    (void)pthread_cond_timedwait(&rb->ring_free_cond, &rb->ring_mutex, &deadline);
+}
+
+uint32_t read_ahead_limit(const sys_ringbuffer* rb, uint32_t block) {
+    const uint32_t cap = rb->size - 1;
+    // Half the ring stays for the history (bytes a cursor swap or a short
+    // backward seek reads again) unless a consumer waits for more.
+    uint32_t limit = cap / 2;
+    // After a seek the read-ahead grows with what the consumer takes, so a
+    // seek that is soon followed by another reads little that is never used.
+    const uint64_t grown = static_cast<uint64_t>(rb->taken) / 2 + block;
+    if (grown < limit) limit = static_cast<uint32_t>(grown);
+    // Two blocks at least: one being consumed, one on its way.
+    const uint64_t least = 2ull * block;
+    if (limit < least) limit = static_cast<uint32_t>(least < cap ? least : cap);
+    return limit;
+}
+
+}  // namespace
+
 void* StreamingData(void* arg) {
     cb_buffer_st* cb = static_cast<cb_buffer_st*>(arg);
     sys_ringbuffer* rb = cb->srbuf;
     cb_io_st* in = cb->input;
+    // The input is read only under ring_mutex, the lock every seek holds
+    // while it moves the input and empties the ring, and each block goes
+    // into the ring in the same critical section as its read: no block read
+    // before a seek can be stored after it.
+    pthread_mutex_lock(&rb->ring_mutex);
     while (cb_state_load(cb) != STATE_STOP) {
-        const int block = in->block_size;
-        // The input is read only under ring_mutex, the lock every seek holds
-        // while it moves the input and empties the ring. wlock marks a block
-        // that was read but is not stored yet: a seek in that window has the
-        // ring drop it (rlock), since it comes from before the seek.
-        pthread_mutex_lock(&rb->ring_mutex);
-        const size_t n = in->read(in, cb->base, static_cast<size_t>(block));
+        const int block_size = in->block_size;
+        const uint32_t block = block_size > 0 ? static_cast<uint32_t>(block_size) : 1;
+        const uint32_t held = rb_held(rb);
+        const uint32_t room = static_cast<uint32_t>(sys_ringbuffer_free_internal(rb));
+        // A consumer waiting for more than is held gets the ring's whole room.
+        const bool starved = rb->rsize_req > 0 && static_cast<uint32_t>(rb->rsize_req) > held;
+        const uint32_t limit = read_ahead_limit(rb, block);
+        const bool want_more = starved || held + block <= limit;
+        if (room < block || !want_more) {
+            // Woken when the consumer has released enough (a whole block's
+            // room, and read-ahead below its limit), when it waits for data,
+            // when a seek empties the ring, or at the close.
+            const uint32_t cap = rb->size - 1;
+            const uint32_t need = want_more ? block : cap - limit + block;
+            rb->wsize_req = static_cast<int32_t>(need);
+            wait_for_wake(rb);
+            rb->wsize_req = 0;
+            continue;
+        }
+        if (rb_eos(rb) && !rb->retry_read) {
+            // Nothing more until a seek or the close; an input that grows
+            // is read again after a short wait.
+            wait_for_wake(rb, kEndOfInputRetryNs);
+            rb->retry_read = 1;
+            continue;
+        }
+        rb->retry_read = 0;
+        uint8_t* at = nullptr;
+        const uint32_t n_room = sys_ringbuffer_wspace_locked(rb, block, &at);
+        const size_t n = in->read(in, at, n_room);
         if (n == 0) {
             rb_set_eos(rb, 1);
             if (rb->rsize_req) pthread_cond_signal(&rb->ring_avail_cond);
-        } else {
-            rb->wlock = 1;
-            // More data after the end (growing input) reopens the stream.
-            rb_set_eos(rb, 0);
-        }
-        pthread_mutex_unlock(&rb->ring_mutex);
-        if (n == 0) {
-            // Polls for data that arrives later without spinning on the input.
-            usleep(1000);
             continue;
         }
-        RecordWrite(cb->base, static_cast<uint32_t>(n));
-        // Never store without room: wait until the consumer releases, the
-        // ring is emptied by a seek, or the reader is closing.
-        bool stopping = false;
-        for (;;) {
-            const int32_t room = sys_ringbuffer_walloc(rb, static_cast<uint32_t>(n));
-            if (room >= static_cast<int32_t>(n)) break;
-            if (cb_state_load(cb) == STATE_STOP) {
-                stopping = true;
-                break;
-            }
-            if (room >= 0) usleep(1000);  // end of stream set: walloc does not wait
-        }
-        if (stopping) break;
-        // Clears wlock in the same critical section as the store.
-        sys_ringbuffer_byte_write(rb, cb->base, static_cast<uint32_t>(n));
+        // More data after the end (growing input) reopens the stream.
+        rb_set_eos(rb, 0);
+        RecordWrite(at, static_cast<uint32_t>(n));
+        sys_ringbuffer_commit_locked(rb, static_cast<uint32_t>(n));
     }
+    pthread_mutex_unlock(&rb->ring_mutex);
     return nullptr;
 }
 
@@ -80,6 +130,10 @@ int OpenStream(cb_buffer_st* cb, const hova_callback_st* cbs) {
 
 void CloseStream(cb_buffer_st* cb, const hova_callback_st* cbs) {
     cb_state_store(cb, STATE_STOP);
+    // Wake the thread wherever it waits; it sees the stop under the lock.
+    pthread_mutex_lock(&cb->srbuf->ring_mutex);
+    pthread_cond_signal(&cb->srbuf->ring_free_cond);
+    pthread_mutex_unlock(&cb->srbuf->ring_mutex);
     pthread_join(cb->thread->handle, nullptr);
     cbs->freep(cbs->context, &cb->stream_thread_stack);
     cb->thread_type = CB_SINGLE_THREAD;

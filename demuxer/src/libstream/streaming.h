@@ -39,6 +39,10 @@ void changeThreadType(cb_buffer_st* cbuf, int useRingBuf);
 void cb_reset_cache(cb_buffer_st* cbuf);
 /* Asks the host to drop its own data (seek_time(-1)), then cb_reset_cache. */
 void cb_flush_data(cb_buffer_st* cbuf);
+/* Has the host move its input to a time (seek_time, in ms, when it offers
+ * it), then adopts its position like cb_reset_cache; with a streaming thread
+ * both happen under the lock the thread reads the input with. */
+void cb_seek_time_reset(cb_buffer_st* cbuf, int time_ms);
 void cb_flush_es_data(cb_buffer_st* cbuf, es_data_type_et type);
 /* 0 turns buffering off, non-zero back on; -1 when the input refuses the seek. */
 int cb_set_buffer_mode(cb_buffer_st* cbuf, int enable);

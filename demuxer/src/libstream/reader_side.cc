@@ -1,0 +1,156 @@
+// Excursions outside the ring: a seek to bytes the ring neither holds nor
+// keeps reads one block there into the side block (the reader's base block)
+// and puts the input back where the ring's producer left it, so the ring and
+// its read-ahead survive a short visit (open reading the index behind the
+// data, a timestamp probe, the far cursor of separate parsing). Reading on
+// past the side block's end continues in the ring when the ring starts there,
+// else the ring moves there: no byte is read twice.
+#include <string.h>
+
+#include "stream_internal.h"
+
+namespace {
+
+static_assert(sizeof(ring_side_st) <= CB_CACHE_HEAD, "the side record fits the head of the base block");
+
+uint8_t* side_memory(const cb_buffer_st* cb) { return cb->base + CB_CACHE_HEAD; }
+
+cb_fpos side_end(const ring_side_st* s) { return s->side_pos + s->side_len; }
+
+// Reads a block at `target` into the side block; the input goes back to the
+// end of what the ring holds. -1 (nothing changed) when the input refuses
+// to go to `target`.
+cb_off_t fetch_side(cb_buffer_st* cb, cb_fpos target) {
+    ring_side_st* s = ring_side(cb);
+    sys_ringbuffer* rb = cb->active_rbuf;
+    cb_io_st* in = cb->input;
+    const cb_fpos ring_pos = s->active ? s->ring_pos : cb->curpos;
+    pthread_mutex_lock(&rb->ring_mutex);
+    if (in->seek(in, static_cast<cb_off_t>(target), CB_SEEK_SET) == -1) {
+        pthread_mutex_unlock(&rb->ring_mutex);
+        return -1;
+    }
+    const int block = in->block_size;
+    const size_t n = block > 0 ? in->read(in, side_memory(cb), static_cast<size_t>(block)) : 0;
+    cb_fpos back = ring_pos + rb_held(rb);
+    if (in->seek(in, static_cast<cb_off_t>(back), CB_SEEK_SET) == -1) {
+        // The input stays behind the side block: the ring starts there.
+        back = target + n;
+        sys_ringbuffer_reset_locked(rb);
+        s->ring_pos = back;
+    } else {
+        s->ring_pos = ring_pos;
+    }
+    pthread_mutex_unlock(&rb->ring_mutex);
+    s->active = 1;
+    s->valid = 1;
+    s->side_pos = target;
+    s->side_len = static_cast<uint32_t>(n);
+    cb->curpos = target;
+    return static_cast<cb_off_t>(target);
+}
+
+// At the side block's end: back to the ring, which moves there unless it
+// already starts there. False when the input refuses the move.
+bool leave_side_at_end(cb_buffer_st* cb) {
+    ring_side_st* s = ring_side(cb);
+    const cb_fpos end = side_end(s);
+    if (s->ring_pos != end) {
+        const cb_off_t r = reposition_ring_input(cb, static_cast<cb_off_t>(end), CB_SEEK_SET);
+        if (r == -1) return false;
+    }
+    s->active = 0;
+    cb->curpos = end;
+    return true;
+}
+
+}  // namespace
+
+ring_side_st* ring_side(const cb_buffer_st* cb) { return reinterpret_cast<ring_side_st*>(cb->base); }
+
+bool side_active(const cb_buffer_st* cb) { return cb->base && cb->active_rbuf && ring_side(cb)->active; }
+
+int32_t side_read(cb_buffer_st* cb, uint8_t* dst, int32_t size, bool* more) {
+    ring_side_st* s = ring_side(cb);
+    *more = false;
+    const cb_fpos end = side_end(s);
+    int32_t n = 0;
+    if (cb->curpos < end) {
+        const uint64_t left = end - cb->curpos;
+        n = left < static_cast<uint64_t>(size) ? static_cast<int32_t>(left) : size;
+        if (dst) memcpy(dst, side_memory(cb) + (cb->curpos - s->side_pos), static_cast<size_t>(n));
+        cb->curpos += static_cast<cb_fpos>(n);
+    }
+    // The rest comes from the ring, from the side block's end on.
+    if (n < size && leave_side_at_end(cb)) *more = true;
+    return n;
+}
+
+int32_t side_peek(cb_buffer_st* cb, uint8_t* dst, int32_t size, bool* use_ring) {
+    ring_side_st* s = ring_side(cb);
+    *use_ring = false;
+    const int block = cb->input->block_size;
+    // A side block shorter than a block ends at the end of the input: a peek
+    // beyond it is short whatever reads it.
+    const bool at_end = block > 0 && s->side_len < static_cast<uint32_t>(block);
+    if (cb->curpos + static_cast<uint32_t>(size) > side_end(s) && !at_end) {
+        if (size > block) {
+            // Larger than a side block: from the ring.
+            if (reposition_ring_input(cb, static_cast<cb_off_t>(cb->curpos), CB_SEEK_SET) != -1) {
+                s->active = 0;
+                *use_ring = true;
+                return 0;
+            }
+        } else if (fetch_side(cb, cb->curpos) == -1) {
+            cb->cb_errcode = CB_ERR_EOF;
+            return 0;
+        }
+    }
+    uint64_t left = side_end(s) > cb->curpos ? side_end(s) - cb->curpos : 0;
+    const int32_t n = left < static_cast<uint64_t>(size) ? static_cast<int32_t>(left) : size;
+    if (dst && n > 0) memcpy(dst, side_memory(cb) + (cb->curpos - s->side_pos), static_cast<size_t>(n));
+    cb->cb_errcode = n < size ? CB_ERR_EOF : CB_ERR_OK;
+    return n;
+}
+
+cb_off_t ring_seek_to(cb_buffer_st* cb, cb_off_t target) {
+    if (target < 0) return -1;
+    sys_ringbuffer* rb = cb->active_rbuf;
+    ring_side_st* s = ring_side(cb);
+    const cb_fpos t = static_cast<cb_fpos>(target);
+    if (s->valid && t >= s->side_pos && t < side_end(s)) {
+        // Back into the block of an earlier visit: no input.
+        if (!s->active) {
+            s->ring_pos = cb->curpos;
+            s->active = 1;
+        }
+        cb->curpos = t;
+        return target;
+    }
+    const cb_fpos rp = s->active ? s->ring_pos : cb->curpos;
+    const uint64_t held = rb_held(rb);
+    const int block = cb->input->block_size;
+    // Inside what the ring holds, or close enough behind it that reading on
+    // costs less than a visit elsewhere.
+    // Reading on through the ring up to half its size keeps the bytes in
+    // between for a cursor that is behind (they become history).
+    uint64_t near = held + static_cast<uint64_t>(block > 0 ? block : 0);
+    if (near < (rb->size - 1) / 2) near = (rb->size - 1) / 2;
+    if (t >= rp && t - rp <= near) {
+        s->active = 0;
+        cb->curpos = rp;
+        if (t > rp) (void)cb->cb_read(cb, nullptr, static_cast<int32_t>(t - rp));
+        if (cb->curpos == t) return target;
+        // The input ended first: a visit past its end, as for any far target.
+    }
+    if (t < rp) {
+        const cb_fpos was = cb->curpos;
+        cb->curpos = rp;
+        if (rewind_ring(cb, target)) {
+            s->active = 0;
+            return target;
+        }
+        cb->curpos = was;
+    }
+    return fetch_side(cb, t);
+}
