@@ -111,7 +111,7 @@ TEST(IndexSeek, IndexThatCannotAnswerLeavesTheSeekToTheSearch) {
     {
         Clip c;  // more entries declared than the file holds
         c.index_declared_count = 1000;
-        c.cut_after_index_header = true;
+        c.cut_after_entries = 2;
         cases.push_back({"beyond the end of the file", c, false});
     }
     {
@@ -177,6 +177,23 @@ TEST(IndexSeek, NetworkInputSeeksVideoOnlyThroughAUsableIndex) {
         t = 2200000;
         EXPECT_EQ(seektest::seek(p, HOVA_SEEK_BACKWARD, &t), HOVA_OK);
         EXPECT_EQ(t, 2000000);
+        p.expect_clean_close();
+    }
+    {
+        // The file ends inside a run of entries repeating the target's
+        // packet: the run ends with the last entry read, whose key frame
+        // (2.5 s) answers a forward seek to 2.2 s.
+        Clip c = every_frame_key({0, 10, 25, 25});
+        c.index_declared_count = 10;
+        c.cut_after_entries = 4;
+        Player p(seektest::build(c), net);
+        p.open_or_fail();
+        int64_t t = 2200000;
+        EXPECT_EQ(seektest::seek(p, HOVA_SEEK_FORWARD, &t), HOVA_OK);
+        EXPECT_EQ(t, 2500000);
+        ASSERT_EQ(p.play(), HOVA_EndOfStream);
+        ASSERT_FALSE(p.frames(HOVA_STREAM_VIDEO).empty());
+        EXPECT_EQ(p.frames(HOVA_STREAM_VIDEO).front().pts, 2500000);
         p.expect_clean_close();
     }
 }

@@ -101,10 +101,8 @@ uint64_t asf_find_packet_by_index(asf_demuxer_st* d, int dir, int64_t* pts) {
         next.packet_number = kNoEntry;
         index = prev_index + 1;
         while (index < d->index_count) {
-            if (!read_next_entry(d, &next)) {
-                next.packet_number = kNoEntry;
-                break;
-            }
+            // A short read ends the run with the last entry read (if any).
+            if (!read_next_entry(d, &next)) break;
             if (next.packet_number != pre.packet_number) break;
             ++index;
         }
