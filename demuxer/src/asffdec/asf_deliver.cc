@@ -196,7 +196,15 @@ extern "C" int asf_deliver_frame(void* ctx, hova_stream_type_et* type, int*, int
     if (d->parse_mode == PARSE_SEP) asf_follow_stream_behind(d);
 
     for (;;) {
-        if (d->cur_packets >= d->num_packets) {
+        bool data_end = d->cur_packets >= d->num_packets;
+        const bool packet_start = !data_end && p->num_payloads == 0;
+        if (packet_start && read_packet_header(d, p, &p->parsed_size) != HOVA_OK) {
+            // Where nothing counts the packets, the end of the input is the
+            // end of the data; elsewhere it ends the stream at once.
+            if (!asf_packets_unbounded(d)) return end_stream(d);
+            data_end = true;
+        }
+        if (data_end) {
             if (d->parse_mode == PARSE_SEP) {
                 asf_resume_other_stream(d);
                 continue;  // the resumed cursor may itself be at the end
@@ -204,13 +212,9 @@ extern "C" int asf_deliver_frame(void* ctx, hova_stream_type_et* type, int*, int
             (void)asf_detect_discontinuity(cb, &d->s.callback);
             return end_stream(d);
         }
-
-        if (p->num_payloads == 0) {
-            if (read_packet_header(d, p, &p->parsed_size) != HOVA_OK) return end_stream(d);
-            if (p->packet_len > d->packet_size || p->padding_len > d->packet_size ||
-                p->num_payloads == 0)
-                return abandon_packet(d);
-        }
+        if (packet_start && (p->packet_len > d->packet_size || p->padding_len > d->packet_size ||
+                             p->num_payloads == 0))
+            return abandon_packet(d);
 
         int announced = 0;
         if (asf_read_payload_header_ex(d, p, &p->parsed_size, &announced) != HOVA_OK)
