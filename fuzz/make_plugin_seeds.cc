@@ -103,6 +103,49 @@ std::vector<std::pair<std::string, Bytes>> built() {
     PacketFile bc = pf;
     bc.broadcast = true;
     out.emplace_back("built_broadcast", build_packet_file(bc));
+
+    // A recorded live stream: packet count 0, data object size 50, half a
+    // packet at the end.
+    PacketFile live = noidx;
+    live.broadcast = true;
+    live.packet_count = 0;
+    live.data_object_size = 50;
+    live.packets.push_back(Bytes(live.packets.back().begin(), live.packets.back().begin() + 500));
+    out.emplace_back("built_broadcast_uncounted", build_packet_file(live));
+
+    // Extended stream properties with a stream name, four payload extension
+    // systems and an embedded stream properties object behind them.
+    File ext;
+    FileProps efp;
+    efp.packet_count = pf.packets.size();
+    efp.min_packet_size = efp.max_packet_size = pf.packet_size;
+    ExtStreamProps es;
+    es.stream_num = 2;
+    es.names = {{0, "Video"}};
+    const PayloadExtSystem sys{guid_from_text("399595EC-8667-4E2D-8FDB-98814CE76C1E"), 0xFFFF, {}};
+    es.ext_systems = {sys, sys, sys, sys};
+    es.embedded_stream = video_stream(2);
+    ExtStreamProps ea;
+    ea.stream_num = 1;
+    ea.ext_systems = {sys, sys, sys};
+    ext.header_children = {file_properties(efp),
+                           header_extension({extended_stream_properties(ea),
+                                             extended_stream_properties(es), language_list({"en"})}),
+                           audio_stream(1)};
+    ext.packets = pf.packets;
+    out.emplace_back("built_long_ext_tail", build(ext));
+
+    // Single-payload packets off their grid: bytes inserted before one
+    // packet (every later one shifted), and bytes lost from another's end.
+    PacketLayout one;
+    one.multiple = false;
+    PacketFile off = noidx;
+    off.packet_size = 512;
+    off.packets = mux(objs, off.packet_size, one, 1, 480);
+    const Bytes junk = {0x90, 0x11, 0x22, 0x33, 0x44, 0x55, 0x66};
+    off.packets[5].insert(off.packets[5].begin(), junk.begin(), junk.end());
+    off.packets[12].resize(off.packets[12].size() - 9);
+    out.emplace_back("built_single_payload_off_grid", build_packet_file(off));
     return out;
 }
 

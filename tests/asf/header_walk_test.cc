@@ -173,16 +173,57 @@ TEST(HeaderWalk, ExtendedStreamPropertiesFillPerStreamTables) {
     }
 }
 
-TEST(HeaderWalk, EmbeddedStreamBehindExtendedPropertiesIsAHiddenStream) {
-    asfb::ExtStreamProps es;
-    es.stream_num = 3;
-    es.embedded_stream = asfb::audio_stream(3);
-    Opened o = open_file(file_with({asfb::audio_stream(1), wrap_ext({asfb::extended_stream_properties(es)})}));
-    ASSERT_EQ(o.rc, HOVA_OK);
-    asf_demuxer_st* d = o.ctx();
-    EXPECT_EQ(d->s.num_streams[AUD], 2);
-    EXPECT_EQ(d->stream_info[d->s.active_stream[AUD]].stream_num, 3) << "the later stream is active";
-    EXPECT_TRUE(o.close_clean());
+// The names and payload extension systems behind the fixed body are walked
+// by their counts; a stream properties object behind them is a hidden stream,
+// anything else (or counts that do not fit the object) is skipped with the
+// rest of the object.
+TEST(HeaderWalk, ExtendedPropertiesTailIsWalkedByItsCounts) {
+    const asfb::PayloadExtSystem sys{asfb::guid_from_text("399595EC-8667-4E2D-8FDB-98814CE76C1E"),
+                                     0xFFFF, {}};
+    auto ext = [](std::vector<asfb::PayloadExtSystem> systems,
+                  std::vector<std::pair<uint16_t, std::string>> names, Bytes embedded,
+                  Bytes raw = {}) {
+        asfb::ExtStreamProps es;
+        es.stream_num = 3;
+        es.bitrate = 64000;
+        es.ext_systems = std::move(systems);
+        es.names = std::move(names);
+        es.embedded_stream = std::move(embedded);
+        es.raw_tail = std::move(raw);
+        return asfb::extended_stream_properties(es);
+    };
+    // The name count (at body offset 60) raised past what the object holds.
+    auto overcounted = [](Bytes object) {
+        object[24 + 60] = 200;
+        return object;
+    };
+    const Bytes other_object =
+        asfb::object(asfb::guid_from_text("01020304-0506-0708-090A-0B0C0D0E0F10"), Bytes(60, 7));
+    const struct {
+        const char* what;
+        Bytes ext;
+        int audio_streams;
+    } cases[] = {
+        {"embedded stream right behind the body", ext({}, {}, asfb::audio_stream(3)), 2},
+        {"four extension systems (88 bytes), nothing behind", ext({sys, sys, sys, sys}, {}, {}), 1},
+        {"a name and four extension systems, then an embedded stream",
+         ext({sys, sys, sys, sys}, {{0, "Audio"}}, asfb::audio_stream(3)), 2},
+        {"another object behind the entries", ext({sys}, {}, {}, other_object), 1},
+        {"fewer than 78 bytes behind the entries", ext({sys}, {}, {}, Bytes(77, 0)), 1},
+        {"counts that run past the object", overcounted(ext({}, {}, asfb::audio_stream(3))), 1},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.what);
+        Opened o = open_file(file_with({asfb::audio_stream(1), wrap_ext({c.ext, asfb::language_list({"en"})})}));
+        ASSERT_EQ(o.rc, HOVA_OK);
+        asf_demuxer_st* d = o.ctx();
+        EXPECT_EQ(d->s.num_streams[AUD], c.audio_streams);
+        EXPECT_EQ(d->stream_info[d->s.active_stream[AUD]].stream_num, c.audio_streams == 2 ? 3 : 1)
+            << "the later stream is active";
+        EXPECT_EQ(d->stream_bitrate[3], 64000u);
+        EXPECT_STREQ(d->language_list[0], "en") << "the walk goes on behind the object";
+        EXPECT_TRUE(o.close_clean());
+    }
 }
 
 TEST(HeaderWalk, LanguageListEntries) {

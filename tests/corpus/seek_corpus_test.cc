@@ -1,9 +1,9 @@
 // Seeks over the real files: a sweep of targets in both directions, with the
 // file's index and with the index hidden (the copy cut after the data
-// object). Every seek that succeeds lands on a key frame of ffprobe's packet
-// list on the asked side of the target, and delivery then hands over that
-// key frame byte for byte among its first video frames. The sweep is printed
-// as a table (frames delivered before the key frame included).
+// object). Every seek lands on a key frame of ffprobe's packet list on the
+// asked side of the target, and delivery then hands over that key frame byte
+// for byte among its first video frames. The sweep is printed as a table
+// (frames delivered before the key frame included).
 #include <gtest/gtest.h>
 #include <nlohmann/json.hpp>
 
@@ -11,6 +11,9 @@
 #include <cstdio>
 #include <fstream>
 #include <set>
+#include <cmath>
+#include <cstdlib>
+#include <unistd.h>
 
 #include "../delivery/delivery_fixture.h"
 #include "byte_reader.h"
@@ -42,64 +45,38 @@ std::vector<RefPacket> reference(const nlohmann::json& ref, const char* kind) {
     return out;
 }
 
-struct Target {
-    const char* name;
-    double fraction;
-};
-constexpr Target kTargets[] = {{"start", 0.0}, {"10%", 0.1}, {"1/3", 1.0 / 3},
-                               {"1/2", 0.5},   {"3/4", 0.75}, {"past end", 1.25}};
+constexpr int kTargets = 20;
 constexpr int kVideoFramesLooked = 120;
 
 struct Outcome {
     int rc = -1;
     int64_t found = 0;
-    int before = -1;        // video frames delivered before the key frame; -1: not seen
-    bool bytes_match = false;
-    // The index as the seek saw it.
-    int64_t index_start = -1;
-    uint64_t index_interval = 0;
+    int before = -1;  // frames of the kind delivered before the one found; -1: not seen
+    uint32_t crc = 0;
 };
 
 // Opens, seeks, and plays until the frame carrying the found time shows up.
-Outcome seek_and_play(const std::vector<uint8_t>& file, int dir, int64_t target, bool video,
-                      const RefPacket* (*lookup)(int64_t, const void*), const void* ref) {
+Outcome seek_and_play(const std::vector<uint8_t>& file, const host::InputOptions& in, int dir,
+                      int64_t target, hova_stream_type_et kind) {
     Outcome o;
-    Player p(file);
+    Player p(file, in);
     if (p.open() != HOVA_OK) return o;
     o.found = target;
     o.rc = hova_asff_demuxer.seek_time(p.ctx(), dir, &o.found, 0);
-    o.index_start = p.ctx()->index_start_offset;
-    o.index_interval = p.ctx()->index_time_interval;
     if (o.rc == HOVA_OK) {
-        const hova_stream_type_et kind = video ? HOVA_STREAM_VIDEO : HOVA_STREAM_AUDIO;
-        for (int calls = 0; calls < 100000; ++calls) {
+        for (int calls = 0; calls < 100000 && o.before < 0; ++calls) {
             const int r = p.step();
             const auto frames = p.frames(kind);
-            bool done = r != HOVA_OK && r != HOVA_TryAgain;
             for (size_t i = 0; i < frames.size() && o.before < 0; ++i) {
                 if (frames[i].pts != o.found) continue;
                 o.before = static_cast<int>(i);
-                const RefPacket* k = lookup(o.found, ref);
-                o.bytes_match = k && k->size == static_cast<uint32_t>(frames[i].size) &&
-                                k->crc == frames[i].crc32;
+                o.crc = frames[i].crc32;
             }
-            if (o.before >= 0 || frames.size() > kVideoFramesLooked) done = true;
-            if (done) break;
+            if ((r != HOVA_OK && r != HOVA_TryAgain) || frames.size() > kVideoFramesLooked) break;
         }
     }
     p.expect_clean_close();
     return o;
-}
-
-const RefPacket* find_key(int64_t pts, const void* ref) {
-    for (const RefPacket& r : *static_cast<const std::vector<RefPacket>*>(ref))
-        if (r.key && r.pts_us == pts) return &r;
-    return nullptr;
-}
-const RefPacket* find_start(int64_t pts, const void* ref) {
-    for (const RefPacket& r : *static_cast<const std::vector<RefPacket>*>(ref))
-        if (r.pts_us == pts) return &r;
-    return nullptr;
 }
 
 // The file cut right after its data object: no index follows.
@@ -112,116 +89,145 @@ std::vector<uint8_t> without_index(const std::vector<uint8_t>& file, uint32_t fi
     return std::vector<uint8_t>(file.begin(), file.begin() + static_cast<std::ptrdiff_t>(end));
 }
 
-// Packet numbers of the file's simple index entries (empty without one).
-std::vector<uint32_t> index_entries(const std::vector<uint8_t>& file, uint64_t at, uint32_t count) {
-    std::vector<uint32_t> out;
-    for (uint64_t i = 0; i < count && at != 0 && at + 6 * (i + 1) <= file.size(); ++i)
-        out.push_back(plimo::load_le<uint32_t>(file.data() + at + 6 * i));
+// A file to sweep: its bytes and the reference packets of the stream the
+// plug-in seeks on (video when there is any, else audio: every object start).
+struct SweepFile {
+    std::string name;
+    std::vector<uint8_t> bytes;
+    std::vector<RefPacket> own;
+    bool video;
+};
+
+// Files made by ffmpeg at test time: WMV7 and WMV8 with key frames only every
+// 2 s, so that most targets lie far from a key frame.
+std::vector<SweepFile> made_files() {
+    std::vector<SweepFile> out;
+    if (testenv::run_command("command -v ffmpeg >/dev/null && command -v ffprobe >/dev/null", nullptr) != 0)
+        return out;
+    char dir[] = "/tmp/plimo_seek_XXXXXX";
+    if (!::mkdtemp(dir)) return out;
+    for (const char* codec : {"wmv1", "wmv2"}) {
+        const std::string path = std::string(dir) + "/" + codec + ".wmv";
+        std::string json;
+        if (testenv::run_command("ffmpeg -v error -f lavfi -i testsrc=size=160x120:rate=25:duration=7 -c:v " +
+                                     std::string(codec) + " -g 50 -f asf " + path,
+                                 nullptr) != 0 ||
+            testenv::run_command("ffprobe -v quiet -print_format json -show_packets -show_data_hash CRC32 "
+                                 "-select_streams v " + path, &json) != 0)
+            continue;
+        SweepFile f{std::string("ffmpeg-") + codec + ".wmv", {}, {}, true};
+        if (!testenv::read_file(path, &f.bytes)) continue;
+        const nlohmann::json probed = nlohmann::json::parse(json);
+        for (const auto& pk : probed["packets"]) {
+            const std::string hash = pk["data_hash"].get<std::string>();
+            f.own.push_back({std::llround(std::stod(pk["pts_time"].get<std::string>()) * 1000) * 1000,
+                             static_cast<uint32_t>(std::stoul(pk["size"].get<std::string>())),
+                             static_cast<uint32_t>(std::stoul(hash.substr(hash.find(':') + 1), nullptr, 16)),
+                             pk["flags"].get<std::string>().find('K') != std::string::npos, 0});
+        }
+        out.push_back(std::move(f));
+        std::remove(path.c_str());
+    }
+    ::rmdir(dir);
     return out;
 }
 
-TEST(CorpusSeek, SweepLandsOnReferenceKeyFramesAndDeliversThem) {
-    int files = 0;
-    std::printf("%-40s %-8s %-8s %-9s %12s %3s %12s %7s\n", "file", "index", "dir", "target",
-                "target_us", "rc", "found_us", "before");
+// Seeks over the real files (and two made by ffmpeg): 20 targets spread over
+// each file, both directions, with the file's index and with it cut off, in
+// the file cache and unbuffered. A backward seek lands on the last key frame
+// at or before the target (packet 0 at time 0 when there is none), a forward
+// seek on a key frame at or after it whenever one exists, else it fails.
+// Delivery then hands over that key frame byte for byte among its first frames.
+TEST(CorpusSeek, SweepLandsOnTheAskedSideAndDeliversTheKeyFrame) {
+    std::vector<SweepFile> files;
     for (const std::string& path : testenv::corpus_files()) {
         std::ifstream refin(path + ".ffprobe.json");
         if (!refin.good()) continue;
         const nlohmann::json ref = nlohmann::json::parse(refin);
-        const std::string name = path.substr(path.find_last_of('/') + 1);
-        std::vector<uint8_t> file;
-        ASSERT_TRUE(testenv::read_file(path, &file));
-        const std::vector<RefPacket> video = reference(ref, "video");
-        const std::vector<RefPacket> audio = reference(ref, "audio");
-        const bool has_video = !video.empty();
-
-        Player probe(file);
-        ASSERT_EQ(probe.open(), HOVA_OK) << name;
-        const int64_t duration = probe.ctx()->s.duration;
+        SweepFile f{path.substr(path.find_last_of('/') + 1), {}, reference(ref, "video"), true};
+        if (f.own.empty()) {
+            f.own = reference(ref, "audio");
+            f.video = false;
+            for (RefPacket& r : f.own) r.key = true;
+        }
+        ASSERT_TRUE(testenv::read_file(path, &f.bytes));
+        files.push_back(std::move(f));
+    }
+    const size_t corpus = files.size();
+    for (SweepFile& f : made_files()) files.push_back(std::move(f));
+    std::printf("%-40s %-6s %-6s %-8s %12s %3s %12s %7s\n", "file", "index", "buffer", "dir",
+                "target_us", "rc", "found_us", "before");
+    for (const SweepFile& f : files) {
+        Player probe(f.bytes);
+        ASSERT_EQ(probe.open(), HOVA_OK) << f.name;
         const uint32_t first_packet = probe.ctx()->first_packet;
         const bool had_index = probe.ctx()->index_packet != 0;
-        const bool no_packets = probe.ctx()->num_packets == 0;
-        const uint64_t num_packets = probe.ctx()->num_packets;
-        const uint32_t packet_size = probe.ctx()->packet_size;
-        const std::vector<uint32_t> entries =
-            index_entries(file, probe.ctx()->index_packet, probe.ctx()->index_count);
         probe.expect_clean_close();
-        ++files;
 
-        std::vector<std::pair<const char*, std::vector<uint8_t>>> variants = {{had_index ? "index" : "none", file}};
-        if (has_video && had_index) variants.push_back({"hidden", without_index(file, first_packet)});
-        const std::vector<RefPacket>& own = has_video ? video : audio;
-        int64_t last_key = -1, first_key = INT64_MAX;
-        uint64_t last_key_packet = 0;
-        for (const RefPacket& r : own) {
-            if (!r.key && has_video) continue;
-            last_key = std::max(last_key, r.pts_us);
-            first_key = std::min(first_key, r.pts_us);
-            last_key_packet = std::max(last_key_packet, (r.pos - first_packet) / packet_size);
-        }
+        std::vector<int64_t> keys;
+        for (const RefPacket& r : f.own)
+            if (r.key) keys.push_back(r.pts_us);
+        std::sort(keys.begin(), keys.end());
+        ASSERT_FALSE(keys.empty()) << f.name;
+        const int64_t span = f.own.back().pts_us;
+        const hova_stream_type_et kind = f.video ? HOVA_STREAM_VIDEO : HOVA_STREAM_AUDIO;
 
+        std::vector<std::pair<const char*, std::vector<uint8_t>>> variants = {
+            {had_index ? "index" : "none", f.bytes}};
+        if (had_index) variants.push_back({"cut", without_index(f.bytes, first_packet)});
         for (const auto& [variant, bytes] : variants) {
-            for (const Target& tg : kTargets) {
-                const int64_t target = static_cast<int64_t>(duration * tg.fraction);
-                for (int dir : {HOVA_SEEK_BACKWARD, HOVA_SEEK_FORWARD}) {
-                    SCOPED_TRACE(testing::Message() << name << " " << variant << " " << tg.name
-                                                    << " dir " << dir);
-                    const Outcome o = seek_and_play(bytes, dir, target, has_video,
-                                                    has_video ? find_key : find_start,
-                                                    has_video ? &video : &audio);
-                    std::printf("%-40s %-8s %-8s %-9s %12" PRId64 " %3d %12" PRId64 " %7d\n", name.c_str(),
-                                variant, dir == HOVA_SEEK_BACKWARD ? "backward" : "forward", tg.name,
-                                target, o.rc, o.rc == HOVA_OK ? o.found : -1, o.before);
-                    if (target == 0) {
-                        // Time 0 is packet 0 without a search, whatever time
-                        // its first frame carries.
-                        EXPECT_EQ(o.rc, HOVA_OK);
-                        EXPECT_EQ(o.found, 0);
-                        continue;
-                    }
-                    if (o.rc != HOVA_OK) {
-                        // The search fails past the last key frame, and when
-                        // its first (interpolated) probe starts after it,
-                        // since every probe scans forward.
-                        const uint64_t first_probe = std::min<uint64_t>(
-                            static_cast<uint64_t>(static_cast<double>(target) * num_packets / duration),
-                            num_packets - 1);
-                        EXPECT_TRUE(no_packets || target > last_key || first_probe > last_key_packet)
-                            << "target " << target << " last key " << last_key;
-                        continue;
-                    }
-                    if (no_packets) continue;
-                    if (dir == HOVA_SEEK_FORWARD && o.found < target) {
-                        // Only the index answers with an earlier key frame:
-                        // when it names one packet from the target's entry on.
-                        ASSERT_STRNE(variant, "hidden");
-                        ASSERT_GT(o.index_interval, 0u);
-                        const uint64_t slot = target < o.index_start
-                                                  ? 0
-                                                  : (target - o.index_start) / o.index_interval;
-                        ASSERT_LT(slot, entries.size());
-                        for (uint64_t e = slot; e < entries.size(); ++e) EXPECT_EQ(entries[e], entries[slot]);
-                    }
-                    // Backward lands at or before the target, unless no key
-                    // frame lies there (then on the first, or on packet 0).
-                    if (dir == HOVA_SEEK_BACKWARD && o.found != 0 && target >= first_key) {
-                        EXPECT_LE(o.found, target);
-                    }
-                    if (o.found == 0 && target > 0) continue;  // the scan's turn back to packet 0
-                    const RefPacket* k = has_video ? find_key(o.found, &video) : find_start(o.found, &audio);
-                    EXPECT_NE(k, nullptr) << "found " << o.found << " is no reference key frame";
-                    // The stream's last object stays pending at the end.
-                    if (o.found == own.back().pts_us) continue;
-                    EXPECT_GE(o.before, 0) << "the frame at " << o.found << " was not delivered";
-                    if (has_video) {
-                        EXPECT_TRUE(o.bytes_match);
-                        EXPECT_LE(o.before, 8);
+            for (bool cache : {true, false}) {
+                host::InputOptions in;
+                in.disable_cache = !cache;
+                for (int k = 1; k <= kTargets; ++k) {
+                    // Spread over the frames, a little off the frame grid.
+                    const int64_t target = span * k / (kTargets + 1) + 7000;
+                    for (int dir : {HOVA_SEEK_BACKWARD, HOVA_SEEK_FORWARD}) {
+                        SCOPED_TRACE(testing::Message() << f.name << " " << variant << " "
+                                                        << (cache ? "cache" : "none") << " target "
+                                                        << target << " dir " << dir);
+                        const Outcome o = seek_and_play(bytes, in, dir, target, kind);
+                        std::printf("%-40s %-6s %-6s %-8s %12" PRId64 " %3d %12" PRId64 " %7d\n",
+                                    f.name.c_str(), variant, cache ? "cache" : "none",
+                                    dir == HOVA_SEEK_BACKWARD ? "backward" : "forward", target, o.rc,
+                                    o.rc == HOVA_OK ? o.found : -1, o.before);
+                        const bool earlier = keys.front() <= target, later = keys.back() >= target;
+                        if (dir == HOVA_SEEK_FORWARD && !later) {
+                            EXPECT_EQ(o.rc, HOVA_SeekFailed);
+                            continue;
+                        }
+                        if (o.rc != HOVA_OK) {
+                            ADD_FAILURE() << "seek failed with " << o.rc;
+                            continue;
+                        }
+                        if (dir == HOVA_SEEK_BACKWARD) {
+                            EXPECT_LE(o.found, target);
+                            if (!earlier) {
+                                EXPECT_EQ(o.found, 0);
+                                continue;
+                            }
+                        } else {
+                            EXPECT_GE(o.found, target);
+                        }
+                        const RefPacket* key = nullptr;
+                        for (const RefPacket& r : f.own)
+                            if (r.key && r.pts_us == o.found && !key) key = &r;
+                        if (!key) {
+                            ADD_FAILURE() << o.found << " is no reference key frame";
+                            continue;
+                        }
+                        if (key == &f.own.back()) continue;  // the last object stays pending
+                        EXPECT_GE(o.before, 0) << "the frame at " << o.found << " was not delivered";
+                        if (f.video) {
+                            EXPECT_EQ(o.crc, key->crc);
+                            EXPECT_LE(o.before, 8);
+                        }
                     }
                 }
             }
         }
     }
-    if (files == 0) GTEST_SKIP() << "no corpus in " << testenv::corpus_dir();
+    if (corpus == 0) GTEST_SKIP() << "no corpus in " << testenv::corpus_dir();
 }
 
 // Files that interleave audio and video more than 2 s apart play with two
@@ -271,7 +277,9 @@ TEST(CorpusSeek, SeekDuringSeparateParsingRestartsBothStreams) {
                 EXPECT_TRUE(known) << "video frame at " << v[i].pts;
                 if (v[i].pts == t && key_at == v.size()) {
                     key_at = i;
-                    const RefPacket* k = find_key(t, &video);
+                    const RefPacket* k = nullptr;
+                    for (const RefPacket& r : video)
+                        if (r.key && r.pts_us == t) k = &r;
                     ASSERT_NE(k, nullptr);
                     EXPECT_EQ(k->crc, v[i].crc32);
                 }

@@ -270,9 +270,8 @@ TEST(Delivery, MuxedStreamsArriveWholeAndInOrder) {
     }
 }
 
-TEST(Delivery, PacketCountZeroEndsAtTheFirstCall) {
+TEST(Delivery, NoPacketsEndsAtTheFirstCall) {
     asfb::PacketFile f;
-    f.packets = {asfb::packet({asfb::media(1, 1, 0, 10, 0, asfb::pattern(10, 1))}, 1024)};
     f.packet_count = 0;
     Player pl(asfb::build_packet_file(f));
     pl.open_or_fail();
@@ -334,6 +333,73 @@ TEST(Resync, FindsAPacketStartingOffItsPlaceAndKeepsThePartialObject) {
         EXPECT_EQ(pl.of_kind(EventKind::Discard).size(), partial ? 0u : 1u);
         EXPECT_EQ(std::count(pl.results.begin(), pl.results.end(), HOVA_TryAgain), 0);
         pl.expect_clean_close();
+    }
+}
+
+// Damage that moves packets off their grid: bytes inserted before a packet
+// (it and every later packet shifted), the same with the packet's tail cut so
+// that later packets stay on the grid, and bytes lost from a packet (every
+// later packet earlier). Single- and multiple-payload packets, every buffering
+// mode. No frame carries bytes that are not its own, and every object lying
+// wholly in the packets from two after the damage on arrives.
+TEST(Resync, PacketsOffTheirGridNeverLendBytesToOtherObjects) {
+    std::vector<asfb::Object> objs;
+    for (uint32_t i = 0; i < 40; ++i)
+        objs.push_back({static_cast<uint8_t>(1 + i % 2), 40 * i, asfb::pattern(150 + 53 * (i % 5), 700 + i),
+                        i % 2 == 1});
+    asfb::PacketLayout single;
+    single.multiple = false;
+    const Bytes junk = {0x90, 0x11, 0x22, 0x33, 0x44, 0x55, 0x66};
+    enum Kind { kInserted, kInsertedSlotKept, kLost };
+    const char* kind_names[] = {"inserted", "inserted, slot kept", "lost"};
+    const uint32_t kSize = 512, kAt = 4;
+    for (bool multiple : {true, false}) {
+        const std::vector<Bytes> packets = asfb::mux(objs, kSize, multiple ? asfb::PacketLayout{} : single, 1, 480);
+        for (Kind kind : {kInserted, kInsertedSlotKept, kLost}) {
+            std::vector<Bytes> damaged = packets;
+            Bytes& d = damaged[kAt];
+            if (kind == kInserted) d.insert(d.begin(), junk.begin(), junk.end());
+            if (kind == kInsertedSlotKept) {
+                d.insert(d.begin(), junk.begin(), junk.end());
+                d.resize(kSize);
+            }
+            if (kind == kLost) d.resize(kSize - junk.size());
+            asfb::PacketFile f;
+            f.packet_size = kSize;
+            f.packets = damaged;
+            f.packet_count = packets.size();
+            const Bytes file = asfb::build_packet_file(f);
+            // Objects wholly in packets from kAt + 3 on: their first fragment's
+            // packet is found by muxing again up to them.
+            for (int m = 0; m < 2; ++m) {
+                SCOPED_TRACE(testing::Message() << kind_names[kind] << (multiple ? ", multiple" : ", single")
+                                                << (m ? ", none" : ", cache"));
+                host::InputOptions in;
+                in.disable_cache = m == 1;
+                Player pl(file, in);
+                pl.open_or_fail();
+                ASSERT_EQ(pl.play(), HOVA_EndOfStream);
+                std::set<int64_t> seen;
+                for (hova_stream_type_et t : {HOVA_STREAM_AUDIO, HOVA_STREAM_VIDEO})
+                    for (const auto& fr : pl.frames(t)) {
+                        const asfb::Object* o = nullptr;
+                        for (const auto& c : objs)
+                            if (int64_t(c.pts_ms) * 1000 == fr.pts) o = &c;
+                        ASSERT_NE(o, nullptr) << fr.pts;
+                        EXPECT_EQ(fr.crc32, crc(o->data)) << "frame at " << fr.pts;
+                        EXPECT_EQ(fr.size, int(o->data.size())) << "frame at " << fr.pts;
+                        seen.insert(fr.pts);
+                    }
+                // From two packets after the damage on, objects arrive whole.
+                size_t bytes = 0, missing = 0;
+                for (size_t i = 0; i + 2 < objs.size(); ++i) {
+                    bytes += objs[i].data.size();
+                    if (bytes > (kAt + 3) * 480 && !seen.count(int64_t(objs[i].pts_ms) * 1000)) ++missing;
+                }
+                EXPECT_EQ(missing, 0u);
+                pl.expect_clean_close();
+            }
+        }
     }
 }
 

@@ -1,5 +1,7 @@
 // Separate parsing of badly interleaved files, the end of the data with the
 // scan for a new header, and the thumbnail rule.
+#include <optional>
+
 #include "asf_internal.h"
 #include "asf_modes.h"
 #include "asf_packet.h"
@@ -165,6 +167,101 @@ TEST(EndOfData, ScansForANewHeaderWhenTheInputAsksForIt) {
         EXPECT_EQ(notes[0].type, HOVA_STREAM_AUDIO);
         EXPECT_EQ(pl.frames(HOVA_STREAM_AUDIO).size(), 1u);
         pl.expect_clean_close();
+    }
+}
+
+// A recorded live stream: packet count 0 in the file properties. The packets
+// are counted from the data object's size, else from the input's size (whole
+// packets), else delivery goes on until the input ends, in either parsing
+// mode. Every buffering mode plays every object but each stream's last, and a
+// seek either lands on a key frame on its side of the target or fails.
+TEST(EndOfData, UncountedPacketsPlayToTheEndOfTheInputInEveryMode) {
+    const auto interleaved = skewed(30, 0, 40);
+    const auto apart = skewed(30, 0, 3000);  // separate parsing
+    // Half a packet at the end: objects of its own, cut short.
+    Bytes half = asfb::packet({asfb::media(1, 99, 0, 300, 5000, asfb::pattern(300, 9)),
+                               asfb::media(2, 99, 0, 600, 5000, asfb::pattern(600, 9), true)},
+                              1024);
+    half.resize(512);
+    const struct {
+        const char* what;
+        const std::vector<asfb::Object>* objs;
+        std::optional<uint64_t> data_size;
+        bool cut;
+        bool broadcast = true;
+    } files[] = {
+        {"data object counts the packets", &interleaved, std::nullopt, false},
+        {"data object size 50", &interleaved, 50, false},
+        {"data object size 50, half a packet at the end", &interleaved, 50, true},
+        {"data object size 50, separate parsing", &apart, 50, false},
+        {"not broadcast: a duration to interpolate over", &interleaved, 50, false, false},
+    };
+    const struct {
+        const char* what;
+        bool disable_cache, ring, thread, streaming;
+    } modes[] = {{"cache", false, false, false, false}, {"none", true, false, false, false},
+                 {"ring", false, true, false, false},   {"ring+thread", false, true, true, false},
+                 {"streaming", false, false, false, true}};
+    for (const auto& f : files) {
+        asfb::PacketFile pf;
+        pf.packets = asfb::mux(*f.objs, 1024);
+        if (f.cut) pf.packets.push_back(half);
+        pf.packet_count = 0;
+        pf.broadcast = f.broadcast;
+        pf.data_object_size = f.data_size;
+        const Bytes bytes = asfb::build_packet_file(pf);
+        for (const auto& m : modes) {
+            SCOPED_TRACE(testing::Message() << f.what << ", " << m.what);
+            host::InputOptions in;
+            in.disable_cache = m.disable_cache;
+            in.rbuf_mode = m.ring ? CBIO_APPLY_RBUF : CBIO_NO_RBUF;
+            in.use_thread = m.thread;
+            in.streaming = m.streaming;
+            {
+                Player pl(bytes, in);
+                pl.open_or_fail();
+                if (f.broadcast) {
+                    EXPECT_EQ(pl.ctx()->s.duration, 0);
+                }
+                ASSERT_EQ(pl.play(), HOVA_EndOfStream);
+                // Half a packet may complete the last whole objects, never
+                // more: its own objects stay pending.
+                for (uint8_t stream : {1, 2}) {
+                    std::vector<const asfb::Object*> want;
+                    for (const auto& o : *f.objs)
+                        if (o.stream == stream) want.push_back(&o);
+                    const auto frames = pl.frames(stream == 1 ? HOVA_STREAM_AUDIO : HOVA_STREAM_VIDEO);
+                    ASSERT_GE(frames.size(), want.size() - 1) << int(stream);
+                    ASSERT_LE(frames.size(), want.size() - (f.cut ? 0 : 1)) << int(stream);
+                    for (size_t i = 0; i < frames.size(); ++i) {
+                        EXPECT_EQ(frames[i].crc32, crc(want[i]->data)) << int(stream) << " " << i;
+                        EXPECT_EQ(frames[i].pts, int64_t(want[i]->pts_ms) * 1000);
+                    }
+                }
+                EXPECT_EQ(pl.of_kind(EventKind::Notify).size(), 2u) << "end events once each";
+                pl.expect_clean_close();
+            }
+            for (int dir : {HOVA_SEEK_BACKWARD, HOVA_SEEK_FORWARD}) {
+                Player pl(bytes, in);
+                pl.open_or_fail();
+                const int64_t target = int64_t((*f.objs)[1].pts_ms) * 1000 + 610000;
+                int64_t t = target;
+                const int rc = hova_asff_demuxer.seek_time(pl.ctx(), dir, &t, 0);
+                if (rc == HOVA_OK) {
+                    EXPECT_TRUE(dir == HOVA_SEEK_BACKWARD ? t <= target : t >= target) << t;
+                    EXPECT_EQ(pl.play(), HOVA_EndOfStream);
+                    const auto v = pl.frames(HOVA_STREAM_VIDEO);
+                    ASSERT_FALSE(v.empty());
+                    EXPECT_EQ(v.front().pts, t);
+                    bool key = false;
+                    for (const auto& o : *f.objs) key |= o.stream == 2 && o.key && int64_t(o.pts_ms) * 1000 == t;
+                    EXPECT_TRUE(key) << t << " is no key frame";
+                } else {
+                    EXPECT_EQ(rc, HOVA_SeekFailed);
+                }
+                pl.expect_clean_close();
+            }
+        }
     }
 }
 

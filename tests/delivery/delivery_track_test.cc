@@ -98,5 +98,41 @@ TEST(Track, SwitchingOffDuringSeparateParsingLetsTheOtherStreamFinishWhole) {
     }
 }
 
+// A packet abandoned while separate parsing follows one stream, and a stream
+// switched off in the very next breath: the remaining stream goes on from its
+// own place, neither repeating what it delivered nor skipping packets.
+TEST(Track, SwitchingOffRightAfterAnAbandonedPacket) {
+    const auto objs = objects(80, 3000);
+    std::vector<Bytes> packets = asfb::mux(objs, 1024);
+    packets.insert(packets.begin() + 30,
+                   asfb::damaged_packet(asfb::Damage::PaddingTooLong,
+                                        {asfb::media(1, 200, 0, 10, 0, asfb::pattern(10, 1))}, 1024));
+    for (hova_stream_type_et off : {HOVA_STREAM_AUDIO, HOVA_STREAM_VIDEO}) {
+        SCOPED_TRACE(off);
+        const hova_stream_type_et on = off == HOVA_STREAM_AUDIO ? HOVA_STREAM_VIDEO : HOVA_STREAM_AUDIO;
+        Player pl(av_file(packets, 1024));
+        pl.open_or_fail();
+        int rc = HOVA_OK;
+        for (int i = 0; i < 1000 && rc == HOVA_OK; ++i) rc = pl.step();
+        ASSERT_EQ(rc, HOVA_TryAgain);
+        ASSERT_EQ(pl.ctx()->parse_mode, PARSE_SEP);
+        ASSERT_EQ(pl.ctx()->accept_stream_type, HOVA_STREAM_AUDIO) << "audio is behind, followed";
+        ASSERT_EQ(hova_asff_demuxer.set_track(pl.ctx(), off, -1, 0, HOVA_INPUT_MASTER), HOVA_OK);
+        ASSERT_EQ(pl.play(), HOVA_EndOfStream);
+        // Each of the stream's objects once, in order, all but the pending last.
+        const uint8_t stream = on == HOVA_STREAM_AUDIO ? 1 : 2;
+        std::vector<const asfb::Object*> own;
+        for (const auto& o : objs)
+            if (o.stream == stream) own.push_back(&o);
+        const auto frames = pl.frames(on);
+        for (size_t k = 0; k < frames.size() && k < own.size(); ++k) {
+            EXPECT_EQ(frames[k].pts, int64_t(own[k]->pts_ms) * 1000) << k;
+            EXPECT_EQ(frames[k].crc32, crc(own[k]->data)) << k;
+        }
+        EXPECT_EQ(frames.size(), own.size() - 1);
+        pl.expect_clean_close();
+    }
+}
+
 }  // namespace
 }  // namespace delivery

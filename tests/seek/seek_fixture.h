@@ -38,7 +38,7 @@ struct Clip {
     std::optional<std::vector<uint32_t>> index_entries;  // packet numbers
     std::optional<uint64_t> index_interval_100ns;          // written as is
     std::optional<uint32_t> index_declared_count;
-    bool cut_after_index_header = false;                   // the file ends in the index
+    std::optional<uint32_t> cut_after_entries;            // the file ends in the index
     std::optional<uint32_t> cut_in_packet;                 // the file ends halfway into it
 };
 
@@ -118,7 +118,7 @@ inline Bytes build(const Clip& c) {
             // Entry count at offset 52 of the object.
             for (int k = 0; k < 4; ++k) idx[52 + k] = static_cast<uint8_t>(*c.index_declared_count >> (8 * k));
         }
-        if (c.cut_after_index_header) idx.resize(56 + 6 * 2);
+        if (c.cut_after_entries) idx.resize(56 + 6 * size_t{*c.cut_after_entries});
         f.trailing.push_back(idx);
     }
     if (c.cut_in_packet) {

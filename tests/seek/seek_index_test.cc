@@ -96,6 +96,46 @@ TEST(IndexSeek, StartOffsetIsWorkedOutOnceFromTheFirstEntryNamingAnotherPacket) 
     p.expect_clean_close();
 }
 
+// Entry 0's time is worked out from the first entry naming another packet;
+// when that packet's key frame is not that entry's own time, the target's
+// entry is off by some entries. The answer still lies on the asked side:
+// the walk steps over entries naming other packets until it does, or leaves
+// the seek to the search without index.
+TEST(IndexSeek, AnswerLiesOnTheAskedSideWhenEntryZerosTimeIsOff) {
+    // Entry 4 names packet 5 (0.5 s): entry 0 stands for -3.5 s.
+    const std::vector<uint32_t> early = {0, 0, 0, 0, 5, 30, 30, 30, 60, 60};
+    // Entry 2 names packet 40 (4 s): entry 0 stands for +2 s.
+    const std::vector<uint32_t> late = {0, 0, 40, 40, 40, 45, 60, 70, 80, 90};
+    const struct {
+        const std::vector<uint32_t>* entries;
+        int dir;
+        int64_t target, found;
+        int64_t start_offset;
+    } cases[] = {
+        {&early, HOVA_SEEK_BACKWARD, 5800000, 3000000, -3500000},  // entry 9 gives 6 s
+        {&early, HOVA_SEEK_BACKWARD, 2900000, 500000, -3500000},   // entry 6 gives 3 s
+        {&early, HOVA_SEEK_FORWARD, 2900000, 6000000, -3500000},
+        {&late, HOVA_SEEK_FORWARD, 5500000, 6000000, 2000000},     // entry 5 gives 4.5 s
+        {&late, HOVA_SEEK_BACKWARD, 5500000, 4000000, 2000000},
+        // Before the first key frame the index has nothing earlier: the
+        // search without index answers packet 0.
+        {&early, HOVA_SEEK_BACKWARD, -3300000, 0, -3500000},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(testing::Message() << "dir " << c.dir << " target " << c.target);
+        Player p(seektest::build(every_frame_key(*c.entries)));
+        p.open_or_fail();
+        int64_t t = c.target;
+        ASSERT_EQ(seektest::seek(p, c.dir, &t), HOVA_OK);
+        EXPECT_EQ(t, c.found);
+        EXPECT_EQ(p.ctx()->index_start_offset, c.start_offset);
+        ASSERT_EQ(p.play(), HOVA_EndOfStream);
+        ASSERT_FALSE(p.frames(HOVA_STREAM_VIDEO).empty());
+        EXPECT_EQ(p.frames(HOVA_STREAM_VIDEO).front().pts, c.found);
+        p.expect_clean_close();
+    }
+}
+
 TEST(IndexSeek, IndexThatCannotAnswerLeavesTheSeekToTheSearch) {
     struct Case {
         const char* what;
@@ -111,7 +151,7 @@ TEST(IndexSeek, IndexThatCannotAnswerLeavesTheSeekToTheSearch) {
     {
         Clip c;  // more entries declared than the file holds
         c.index_declared_count = 1000;
-        c.cut_after_index_header = true;
+        c.cut_after_entries = 2;
         cases.push_back({"beyond the end of the file", c, false});
     }
     {
@@ -120,7 +160,9 @@ TEST(IndexSeek, IndexThatCannotAnswerLeavesTheSeekToTheSearch) {
         cases.push_back({"interval 0", c, false});
     }
     {
-        Clip c;  // every entry names packet 30: the index answers with it
+        // Every entry names packet 30: the index answers backward with it;
+        // forward its key frame lies before the target.
+        Clip c;
         c.index_entries = std::vector<uint32_t>(10, 30);
         cases.push_back({"all one packet", c, true});
     }
@@ -132,7 +174,7 @@ TEST(IndexSeek, IndexThatCannotAnswerLeavesTheSeekToTheSearch) {
             p.open_or_fail();
             int64_t t = 4550000;
             ASSERT_EQ(seektest::seek(p, dir, &t), HOVA_OK);
-            if (k.index_answers) {
+            if (k.index_answers && dir == HOVA_SEEK_BACKWARD) {
                 EXPECT_EQ(t, 3000000);
                 EXPECT_EQ(p.ctx()->index_start_offset, 0);
             } else {
@@ -177,6 +219,23 @@ TEST(IndexSeek, NetworkInputSeeksVideoOnlyThroughAUsableIndex) {
         t = 2200000;
         EXPECT_EQ(seektest::seek(p, HOVA_SEEK_BACKWARD, &t), HOVA_OK);
         EXPECT_EQ(t, 2000000);
+        p.expect_clean_close();
+    }
+    {
+        // The file ends inside a run of entries repeating the target's
+        // packet: the run ends with the last entry read, whose key frame
+        // (2.5 s) answers a forward seek to 2.2 s.
+        Clip c = every_frame_key({0, 10, 25, 25});
+        c.index_declared_count = 10;
+        c.cut_after_entries = 4;
+        Player p(seektest::build(c), net);
+        p.open_or_fail();
+        int64_t t = 2200000;
+        EXPECT_EQ(seektest::seek(p, HOVA_SEEK_FORWARD, &t), HOVA_OK);
+        EXPECT_EQ(t, 2500000);
+        ASSERT_EQ(p.play(), HOVA_EndOfStream);
+        ASSERT_FALSE(p.frames(HOVA_STREAM_VIDEO).empty());
+        EXPECT_EQ(p.frames(HOVA_STREAM_VIDEO).front().pts, 2500000);
         p.expect_clean_close();
     }
 }

@@ -37,6 +37,10 @@ TEST(SearchWithoutIndex, FindsTheNearestObjectStartInTheAskedDirection) {
     late_key.key_first = 5;  // key frames at 0.5 s, 1.5 s, ...
     Clip audio_only = no_index();
     audio_only.video = false;
+    Clip sparse_keys = no_index();
+    sparse_keys.packets = 40;
+    sparse_keys.key_every = 20;
+    sparse_keys.play_duration_100ns = 30000000;  // 3 s: 1.8 s interpolates past packet 20
     struct Case {
         const char* what;
         Clip clip;
@@ -49,12 +53,19 @@ TEST(SearchWithoutIndex, FindsTheNearestObjectStartInTheAskedDirection) {
         {"between key frames", no_index(), HOVA_SEEK_FORWARD, 2350000, HOVA_OK, 3000000},
         {"exact", no_index(), HOVA_SEEK_BACKWARD, 3000000, HOVA_OK, 3000000},
         {"exact", no_index(), HOVA_SEEK_FORWARD, 3000000, HOVA_OK, 3000000},
-        // The first probe starts after the last key frame (packet 90): every
-        // probe scans forward, so nothing is found in either direction.
-        {"past the end", no_index(), HOVA_SEEK_BACKWARD, 60000000, HOVA_SeekFailed, 60000000},
+        // Probes that start after the last key frame (packet 90) meet nothing
+        // up to the end: backward finds that key frame by walking back,
+        // forward has nothing to find.
+        {"past the end", no_index(), HOVA_SEEK_BACKWARD, 60000000, HOVA_OK, 9000000},
         {"past the end", no_index(), HOVA_SEEK_FORWARD, 60000000, HOVA_SeekFailed, 60000000},
-        {"after the last key frame", no_index(), HOVA_SEEK_BACKWARD, 9200000, HOVA_SeekFailed,
+        {"after the last key frame", no_index(), HOVA_SEEK_BACKWARD, 9200000, HOVA_OK, 9000000},
+        {"after the last key frame", no_index(), HOVA_SEEK_FORWARD, 9200000, HOVA_SeekFailed,
          9200000},
+        // Key frames at 0 and 2 s only: narrowing probes between them run to
+        // the end of the data and end the range there.
+        {"two key frames", sparse_keys, HOVA_SEEK_BACKWARD, 1807000, HOVA_OK, 0},
+        {"two key frames", sparse_keys, HOVA_SEEK_FORWARD, 1807000, HOVA_OK, 2000000},
+        {"two key frames", sparse_keys, HOVA_SEEK_BACKWARD, 3700000, HOVA_OK, 2000000},
         // Nothing at or before the target: the scan reaches packet 0, which
         // is reported with time 0.
         {"before the first key frame", late_key, HOVA_SEEK_BACKWARD, 200000, HOVA_OK, 0},

@@ -377,7 +377,7 @@ Bytes build(const File& f) {
     Writer w;
     if (f.id3_payload) w.bytes(id3v2_prefix(f.id3_payload));
     w.bytes(header_object(f.header_children));
-    w.bytes(data_object(f.packets));
+    w.bytes(data_object(f.packets, f.data_object_size));
     for (const Bytes& t : f.trailing) w.bytes(t);
     return w.take();
 }

@@ -191,6 +191,7 @@ struct File {
     std::vector<Bytes> header_children;
     std::vector<Bytes> packets;
     std::vector<Bytes> trailing;
+    std::optional<uint64_t> data_object_size;  // declared; default: what it holds
 };
 Bytes build(const File& f);
 

@@ -250,6 +250,7 @@ Bytes build_packet_file(const PacketFile& f) {
     }
     file.packets = f.packets;
     file.trailing = f.trailing;
+    file.data_object_size = f.data_object_size;
     return build(file);
 }
 

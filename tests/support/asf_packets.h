@@ -126,6 +126,7 @@ struct PacketFile {
     std::vector<Bytes> packets;
     std::vector<Bytes> trailing;
     bool broadcast = false;
+    std::optional<uint64_t> data_object_size;  // declared (50: a recorded live stream's)
 };
 Bytes build_packet_file(const PacketFile& f);
 

@@ -69,6 +69,11 @@ TEST(AsfdumpProbe, ExitStatusFollowsTheContract) {
     EXPECT_EQ(asfdump("probe /tmp", &out), 3) << "a directory is not a readable file";
     EXPECT_EQ(asfdump("probe /dev/null", &out), 3) << "not a regular file";
     EXPECT_EQ(asfdump("probe /dev/null --plugin /nonexistent.so", &out), 1) << "no plug-in";
+    // Asking for help is no usage error: the usage goes to standard output.
+    for (const char* help : {"--help", "-h", "info /nonexistent/x.wmv --help"}) {
+        EXPECT_EQ(asfdump(help, &out), 0) << help;
+        EXPECT_EQ(out.rfind("usage: asfdump probe FILE\n", 0), 0u) << help;
+    }
 }
 
 }  // namespace

@@ -47,6 +47,10 @@ int main(int argc, char** argv) {
         std::fputs(asfdump::usage_text(), stderr);
         return asfdump::kExitUsage;
     }
+    if (opts.help) {
+        std::fputs(asfdump::usage_text(), stdout);
+        return asfdump::kExitOk;
+    }
     if (!opts.is_url && access(opts.file.c_str(), R_OK) != 0) {
         std::fprintf(stderr, "asfdump: cannot read %s\n", opts.file.c_str());
         return asfdump::kExitUnreadable;

@@ -55,6 +55,7 @@ const char* usage_text() {
     return "usage: asfdump probe FILE\n"
            "       asfdump info FILE [input options]\n"
            "       asfdump frames FILE [input options] [play options]\n"
+           "       asfdump --help\n"
            "FILE may be an http:// URL (default buffering then: --buffer ring --thread)\n"
            "input options: --buffer cache|none|ring, --thread, --block-size N, --ring-size N,\n"
            "               --streaming, --not-seekable, --detect-discontinuity, --plugin PATH\n"
@@ -70,7 +71,7 @@ bool parse_options(int argc, char** argv, Options* o, std::string* error) {
     std::string buffer = "cache";
     int c;
     int64_t v = 0;
-    while ((c = getopt_long(argc, argv, "", kLongOptions, nullptr)) != -1) {
+    while ((c = getopt_long(argc, argv, "h", kLongOptions, nullptr)) != -1) {
         switch (c) {
             case kBuffer:
                 buffer = optarg;
@@ -114,7 +115,10 @@ bool parse_options(int argc, char** argv, Options* o, std::string* error) {
             case kDumpStreams: o->dump_dir = optarg; break;
             case kLog: o->log = true; break;
             case kPlugin: o->plugin = optarg; break;
-            case kHelp: *error = ""; return false;
+            case kHelp:
+            case 'h':
+                o->help = true;
+                return true;
             default:
                 *error = std::string("unknown option ") + (optind > 0 ? argv[optind - 1] : "");
                 return false;

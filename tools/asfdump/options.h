@@ -30,9 +30,11 @@ struct Options {
     int64_t max_frames = -1;
     std::string dump_dir;
     bool log = false;
+    bool help = false;  // --help or -h: print the usage and nothing else
 };
 
 // Parses argv; on a usage error returns false with a message in `error`.
+// With --help (or -h) anywhere it returns true with `help` set at once.
 bool parse_options(int argc, char** argv, Options* out, std::string* error);
 
 const char* usage_text();

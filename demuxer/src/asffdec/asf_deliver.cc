@@ -87,6 +87,23 @@ int32_t read_length_byte(cb_buffer_st* cb, uint8_t* out) {
     return cb->cb_read(cb, out, 1);
 }
 
+// Packets found off their grid: the reader is put on the nearest pair of
+// packet starts. When that is behind it, the last payload of the packet just
+// read ran into the next packet unless its padding covered the distance: its
+// object now holds bytes that are not its own and is dropped.
+void realign(asf_demuxer_st* d) {
+    asf_packet_st* p = &d->cur_data_packet;
+    const int64_t moved = asf_realign_packet(d);
+    if (moved >= 0 || p->padding_len >= static_cast<uint64_t>(-moved)) return;
+    hova_stream_type_et type = HOVA_STREAM_NONE;
+    asf_stream_st* s = get_stream(d, p->stream_num & 0x7F, &type);
+    if (!s) return;
+    if (s->buffer) (void)sys_stream_discard(&d->s, type);
+    s->buffer = nullptr;
+    s->object_num = -1;
+    reset_object_size(s);
+}
+
 // Gives the pending frame back after the host refused to grow it, so that a
 // null buffer always means that nothing is pending.
 void lose_frame(asf_demuxer_st* d, asf_stream_st* s, hova_stream_type_et type) {
@@ -196,7 +213,16 @@ extern "C" int asf_deliver_frame(void* ctx, hova_stream_type_et* type, int*, int
     if (d->parse_mode == PARSE_SEP) asf_follow_stream_behind(d);
 
     for (;;) {
-        if (d->cur_packets >= d->num_packets) {
+        bool data_end = d->cur_packets >= d->num_packets;
+        const bool packet_start = !data_end && p->num_payloads == 0;
+        if (packet_start && d->parse_mode == PARSE_SEQ) realign(d);
+        if (packet_start && read_packet_header(d, p, &p->parsed_size) != HOVA_OK) {
+            // Where nothing counts the packets, the end of the input is the
+            // end of the data; elsewhere it ends the stream at once.
+            if (!asf_packets_unbounded(d)) return end_stream(d);
+            data_end = true;
+        }
+        if (data_end) {
             if (d->parse_mode == PARSE_SEP) {
                 asf_resume_other_stream(d);
                 continue;  // the resumed cursor may itself be at the end
@@ -204,13 +230,9 @@ extern "C" int asf_deliver_frame(void* ctx, hova_stream_type_et* type, int*, int
             (void)asf_detect_discontinuity(cb, &d->s.callback);
             return end_stream(d);
         }
-
-        if (p->num_payloads == 0) {
-            if (read_packet_header(d, p, &p->parsed_size) != HOVA_OK) return end_stream(d);
-            if (p->packet_len > d->packet_size || p->padding_len > d->packet_size ||
-                p->num_payloads == 0)
-                return abandon_packet(d);
-        }
+        if (packet_start && (p->packet_len > d->packet_size || p->padding_len > d->packet_size ||
+                             p->num_payloads == 0))
+            return abandon_packet(d);
 
         int announced = 0;
         if (asf_read_payload_header_ex(d, p, &p->parsed_size, &announced) != HOVA_OK)

@@ -103,31 +103,80 @@ int on_hidden_stream(Walk& w, uint64_t& size) {
     return asf_parse_stream_prop(w.d, size);
 }
 
+bool is_stream_prop_guid(const guid_st& g) {
+    return sys_is_equal_guid(&g, &asf_stream_prop_object) ||
+           sys_is_equal_guid(&g, &asf_stream_prop_object2);
+}
+
+// Steps over the stream names and payload extension systems behind an
+// extended stream properties body, by their own counts and lengths, within
+// the `room` bytes left in the object, adding what it consumed to `used`.
+// False when an entry would run past the object (the reader then stands
+// somewhere inside it); a short read sets `rc` to HOVA_EndOfStream.
+bool skip_tail_entries(asf_demuxer_st* d, uint64_t room, uint16_t names, uint16_t systems,
+                       uint64_t* used, int* rc) {
+    namespace es = asf::ext_stream_prop;
+    *rc = HOVA_OK;
+    for (uint32_t i = 0; i < names + uint32_t{systems}; ++i) {
+        const bool name = i < names;
+        const uint64_t fixed = name ? es::kStreamNameFixed : es::kExtSystemFixed;
+        if (room - *used < fixed) return false;
+        uint8_t b[es::kExtSystemFixed];
+        if (!asf::read_exact(d, b, fixed)) {
+            *rc = HOVA_EndOfStream;
+            return false;
+        }
+        *used += fixed;
+        const uint64_t len = name ? load_le<uint16_t>(b + es::kStreamNameLength)
+                                  : load_le<uint32_t>(b + es::kExtSystemInfoLength);
+        if (room - *used < len) return false;
+        if (!asf::skip(d, len)) {
+            *rc = HOVA_EndOfStream;
+            return false;
+        }
+        *used += len;
+    }
+    return true;
+}
+
 int on_ext_stream_prop(Walk& w, uint64_t& size) {
     namespace es = asf::ext_stream_prop;
     asf_demuxer_st* d = w.d;
-    uint64_t consumed = kHdr;
-    if (size >= kExtStreamFixed) {
-        uint8_t b[es::kSize];
-        if (!asf::read_exact(d, b, sizeof b)) return HOVA_EndOfStream;
-        consumed = kExtStreamFixed;
-        const uint16_t sn = load_le<uint16_t>(b + es::kStreamNum);
-        if (asf_valid_stream_num(sn)) {
-            d->stream_bitrate[sn] = load_le<uint32_t>(b + es::kBitrate);
-            d->stream_language_index[sn] = load_le<uint16_t>(b + es::kStreamLanguageIndex);
-            d->time_per_frame[sn] =
-                static_cast<uint32_t>(load_le<uint64_t>(b + es::kAvgTimePerFrame) / 10);
+    if (size < kExtStreamFixed) {
+        (void)asf::skip(d, size - kHdr);
+        return HOVA_OK;
+    }
+    uint8_t b[es::kSize];
+    if (!asf::read_exact(d, b, sizeof b)) return HOVA_EndOfStream;
+    const uint16_t sn = load_le<uint16_t>(b + es::kStreamNum);
+    if (asf_valid_stream_num(sn)) {
+        d->stream_bitrate[sn] = load_le<uint32_t>(b + es::kBitrate);
+        d->stream_language_index[sn] = load_le<uint16_t>(b + es::kStreamLanguageIndex);
+        d->time_per_frame[sn] =
+            static_cast<uint32_t>(load_le<uint64_t>(b + es::kAvgTimePerFrame) / 10);
+    }
+
+    // Stream names and payload extension systems follow, as many as the body
+    // counts; nothing here uses them. Behind them an encoder may embed the
+    // stream's own stream properties object: the walk is then left in front
+    // of it, so that it is met as the next child (a hidden stream).
+    const uint64_t room = size - kExtStreamFixed;
+    uint64_t used = 0;
+    int rc = HOVA_OK;
+    const bool whole = skip_tail_entries(d, room, load_le<uint16_t>(b + es::kStreamNameCount),
+                                         load_le<uint16_t>(b + es::kPayloadExtSystemCount),
+                                         &used, &rc);
+    if (rc != HOVA_OK) return rc;
+    if (whole && room - used >= kEmbeddedStreamMin) {
+        uint8_t g[16];
+        cb_buffer_st* cb = &d->s.cbuffer;
+        if (cb->cb_peek(cb, g, sizeof g) == static_cast<int32_t>(sizeof g) &&
+            is_stream_prop_guid(guid_from_bytes(g))) {
+            size = kExtStreamFixed + used;
+            return HOVA_OK;
         }
     }
-    const uint64_t rest = size - consumed;
-    if (rest >= 1 && rest < kEmbeddedStreamMin) {
-        // Stream names and payload extension systems: nothing here uses them.
-        (void)asf::skip(d, rest);
-    } else if (size > consumed) {
-        // Room for an embedded stream properties object: go on right behind
-        // the fixed body so that it is met as the next child.
-        size = consumed;
-    }
+    if (room > used) (void)asf::skip(d, room - used);
     return HOVA_OK;
 }
 

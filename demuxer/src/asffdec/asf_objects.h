@@ -49,6 +49,10 @@ inline constexpr size_t kStartTime = 0, kEndTime = 8, kBitrate = 16, kBufferSize
                         kAltInitBufferFullness = 36, kMaxObjSize = 40, kFlags = 44,
                         kStreamNum = 48, kStreamLanguageIndex = 50, kAvgTimePerFrame = 52,
                         kStreamNameCount = 60, kPayloadExtSystemCount = 62;
+// Entries behind the body: a stream name (language index, byte count, name)
+// and a payload extension system (GUID, data size, info length, info).
+inline constexpr size_t kStreamNameFixed = 4, kStreamNameLength = 2;
+inline constexpr size_t kExtSystemFixed = 22, kExtSystemInfoLength = 18;
 }  // namespace ext_stream_prop
 
 // Content description: five uint16 byte counts, then the five strings.

@@ -7,6 +7,7 @@
 #include "asf_internal.h"
 #include "asf_io.h"
 #include "asf_objects.h"
+#include "asf_packet.h"
 #include "byte_reader.h"
 #include "dprintf.h"
 #include "streaming.h"
@@ -30,6 +31,25 @@ int fail_open(asf_demuxer_st* d, int rc) {
     asf_free_memory(d);
     CloseURL(&d->s.cbuffer, &d->s.callback);
     return rc;
+}
+
+// The packet count when the file properties give none (a recorded live
+// stream): from the data object's size when it covers a packet, else whole
+// packets up to the end of the input when its size is known, else unbounded.
+uint64_t count_packets(asf_demuxer_st* d, uint64_t data_size) {
+    const uint64_t packet = d->packet_size;
+    if (data_size >= asf::data_object::kSize + packet)
+        return (data_size - asf::data_object::kSize) / packet;
+    cb_buffer_st* rd = &d->s.cbuffer;
+    uint64_t size = rd->input ? rd->input->input_size : 0;
+    // The single-thread reader can measure a seekable input (and is put back
+    // on the first packet); the ring's reader cannot.
+    if (size == 0 && d->s.seekable && !d->s.streaming && rd->cb_seek64 == cb_seek_single64) {
+        size = cb_get_file_size(rd);
+        (void)rd->cb_seek64(rd, d->first_packet, CB_SEEK_SET);
+    }
+    if (size != 0) return size > d->first_packet ? (size - d->first_packet) / packet : 0;
+    return asf_unbounded_packet_count(d);
 }
 
 }  // namespace
@@ -137,6 +157,8 @@ extern "C" int asf_init_demuxer(void** ctx, cb_io_st* cbio, void* buffer, int bu
     d->resync = 0;
     d->cur_packets = 0;
     d->first_packet = static_cast<uint32_t>(cb_tell64(rd));
+    const uint64_t data_size = load_le<uint64_t>(data_obj + asf::kObjSize);
+    if (d->num_packets == 0) d->num_packets = count_packets(d, data_size);
     d->index_packet = 0;
     d->accept_stream_type = HOVA_STREAM_NONE;
     d->index_count = 0;
@@ -154,7 +176,6 @@ extern "C" int asf_init_demuxer(void** ctx, cb_io_st* cbio, void* buffer, int bu
 
     // Step over the packets to what follows the data object. A size below
     // its own header would be a backward seek: the index is then unreachable.
-    const uint64_t data_size = load_le<uint64_t>(data_obj + asf::kObjSize);
     if (data_size >= asf::data_object::kSize &&
         asf::skip(d, data_size - asf::data_object::kSize))
         asf_parse_index(d);

@@ -7,7 +7,9 @@
 #include "asf_packet.h"
 
 #include <cstring>
+#include <initializer_list>
 
+#include "asf_timestamp.h"
 #include "byte_reader.h"
 #include "streaming.h"
 #include "sys_output.h"
@@ -107,9 +109,9 @@ int parse_packet_header(asf_demuxer_st* d, Source& src, asf_packet_st* p, uint32
                 src.incomplete = true;
                 return HOVA_EndOfStream;
             } else {
-                // Bytes the scan passes over belong to this packet's slot, so
-                // the end-of-packet skip still lands on the next packet.
-                counter += resync_packet(d, &flags);
+                // The packet starts at the found byte: it is read whole from
+                // there, and the next one is looked for at its end.
+                (void)resync_packet(d, &flags);
             }
         }
         if (flags & 0x80) {
@@ -331,4 +333,83 @@ uint32_t resync_packet(asf_demuxer_st* d, uint8_t* first_byte) {
     }
     if (fresh) (void)sys_stream_discard(&d->s, owner_type);
     return passed;
+}
+
+namespace {
+
+constexpr int32_t kRealignReach = 256;  // bytes looked at on either side
+constexpr int32_t kStartBytes = 5;
+
+bool usual_packet_start(const uint8_t* b) {
+    if (b[0] & 0x80) return b[0] == kEcFlagsUsual && b[4] == kPropertyFlagsUsual;
+    return b[1] == kPropertyFlagsUsual;
+}
+
+// True when a usual packet start lies at `pos` and, unless it is the last
+// packet, another one packet later.
+bool confirmed_start(cb_buffer_st* cb, uint64_t pos, uint32_t packet_size, bool last) {
+    uint8_t b[kStartBytes];
+    for (uint64_t at : {pos, pos + packet_size}) {
+        if (at != pos && last) break;
+        if (cb->cb_seek64(cb, static_cast<cb_off_t>(at), CB_SEEK_SET) == -1) return false;
+        if (cb->cb_peek(cb, b, kStartBytes) != kStartBytes || !usual_packet_start(b)) return false;
+    }
+    return true;
+}
+
+}  // namespace
+
+int64_t asf_realign_packet(asf_demuxer_st* d) {
+    cb_buffer_st* cb = &d->s.cbuffer;
+    asf_packet_st* p = &d->cur_data_packet;
+    const uint64_t pos = cb_tell64(cb);
+    const uint64_t grid = asf_packet_position(d, d->cur_packets);
+    const bool last = d->cur_packets + 1 >= d->num_packets;
+    if (pos < d->first_packet) return 0;
+    // Only files whose packets start in the usual form are looked after: the
+    // previous packet had it (or nothing was read since a repositioning).
+    if (p->property_flags != kPropertyFlagsUsual && p->property_flags != 0) return 0;
+    uint8_t b[kStartBytes];
+    const bool usual_here = cb->cb_peek(cb, b, kStartBytes) == kStartBytes && usual_packet_start(b);
+    if (usual_here && pos == grid) return 0;
+
+    uint64_t found = UINT64_MAX;
+    if (usual_here && (b[0] & 0x80) && confirmed_start(cb, pos, d->packet_size, last)) {
+        found = pos;
+    } else {
+        // Nearest first, ahead before behind, never before the data.
+        uint8_t w[2 * kRealignReach + kStartBytes];
+        const uint64_t from = pos - d->first_packet >= static_cast<uint64_t>(kRealignReach)
+                                  ? pos - kRealignReach
+                                  : d->first_packet;
+        int32_t got = -1;
+        if (cb->cb_seek64(cb, static_cast<cb_off_t>(from), CB_SEEK_SET) != -1)
+            got = cb->cb_peek(cb, w, static_cast<int32_t>(sizeof w));
+        const int64_t here = static_cast<int64_t>(pos - from);
+        // Starts with error correction data first: the bytes behind its flags
+        // look like a start without it.
+        for (int pass = 0; pass < 2 && found == UINT64_MAX; ++pass)
+        for (int32_t dist = 0; dist <= kRealignReach && found == UINT64_MAX; ++dist) {
+            for (int64_t at : {here + dist, here - dist}) {
+                if (at < 0 || at + kStartBytes > got || !usual_packet_start(w + at) ||
+                    ((w[at] & 0x80) != 0) != (pass == 0))
+                    continue;
+                if (confirmed_start(cb, from + static_cast<uint64_t>(at), d->packet_size, last)) {
+                    found = from + static_cast<uint64_t>(at);
+                    break;
+                }
+            }
+        }
+    }
+    // The grid moves with the packets; a grid that would leave the 32-bit
+    // range stays where it is.
+    const int64_t shift = found == UINT64_MAX ? 0 : static_cast<int64_t>(found - grid);
+    const int64_t first = static_cast<int64_t>(d->first_packet) + shift;
+    if (found == UINT64_MAX || first < 0 || first > static_cast<int64_t>(UINT32_MAX)) {
+        (void)cb->cb_seek64(cb, static_cast<cb_off_t>(pos), CB_SEEK_SET);
+        return 0;
+    }
+    d->first_packet = static_cast<uint32_t>(first);
+    (void)cb->cb_seek64(cb, static_cast<cb_off_t>(found), CB_SEEK_SET);
+    return static_cast<int64_t>(found - pos);
 }

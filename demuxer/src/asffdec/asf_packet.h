@@ -26,6 +26,24 @@ int read_payload_header(asf_demuxer_st* d, asf_packet_st* p, uint32_t* parsed);
 int asf_read_payload_header_ex(asf_demuxer_st* d, asf_packet_st* p, uint32_t* parsed,
                                int* announced_size);
 
+// Packet count of a file whose packets are counted by nobody (file
+// properties and data object both say 0, and the input's size is unknown):
+// as many as positions can address. Delivery then ends where the input ends.
+inline uint64_t asf_unbounded_packet_count(const asf_demuxer_st* d) {
+    return (static_cast<uint64_t>(INT64_MAX) - UINT32_MAX) / d->packet_size;
+}
+inline bool asf_packets_unbounded(const asf_demuxer_st* d) {
+    return d->num_packets == asf_unbounded_packet_count(d);
+}
+
+// At a packet start in sequential delivery: when the bytes there do not start
+// a packet of the usual form, or the reader stands off the packet grid (a
+// packet the scan found off its place was read whole from where it starts),
+// looks for two usual packet starts one packet apart near the reader and, when
+// found, moves the packet grid (first_packet) and the reader there. Returns
+// the distance moved in bytes (negative: back), 0 when nothing moved.
+int64_t asf_realign_packet(asf_demuxer_st* d);
+
 // Moves the reader to the byte the record stands at; -1 on failure.
 cb_off_t asf_seek_to_packet_with_parsed(asf_demuxer_st* d, const asf_packet_st* p);
 

@@ -95,16 +95,17 @@ uint64_t asf_find_packet_by_index(asf_demuxer_st* d, int dir, int64_t* pts) {
     // taken: once going backward, as long as that holds going forward.
     uint32_t index = static_cast<uint32_t>(slot);
     IndexEntry pre, next;
+    uint32_t pre_at = index, next_at = index;  // entry numbers of the two
     for (;;) {
         if (!read_entry_at(d, index, &pre)) return kAsfNoPacket;
+        pre_at = index;
         const uint32_t prev_index = index;
         next.packet_number = kNoEntry;
         index = prev_index + 1;
         while (index < d->index_count) {
-            if (!read_next_entry(d, &next)) {
-                next.packet_number = kNoEntry;
-                break;
-            }
+            // A short read ends the run with the last entry read (if any).
+            if (!read_next_entry(d, &next)) break;
+            next_at = index;
             if (next.packet_number != pre.packet_number) break;
             ++index;
         }
@@ -116,12 +117,30 @@ uint64_t asf_find_packet_by_index(asf_demuxer_st* d, int dir, int64_t* pts) {
         }
         if (target < t) break;
         pre = next;
+        pre_at = next_at;
         if (dir == HOVA_SEEK_BACKWARD) break;
     }
 
-    const uint32_t packet = dir == HOVA_SEEK_BACKWARD ? pre.packet_number : next.packet_number;
-    const int64_t t = get_packet_pts_with_number(d, packet);
+    const bool back = dir == HOVA_SEEK_BACKWARD;
+    uint32_t at = back ? pre_at : next_at;
+    uint32_t packet = back ? pre.packet_number : next.packet_number;
+    int64_t t = get_packet_pts_with_number(d, packet);
     if (t == -1) return kAsfNoPacket;
+    // Entry 0's time is worked out from a key frame found at or after a later
+    // entry's packet, which need not be that entry's own time: the walk may
+    // end an entry off. Step entry by entry (over entries repeating the
+    // packet) until the key frame lies on the asked side of the target.
+    while (back ? t > target : t < target) {
+        IndexEntry e;
+        do {
+            if (back ? at == 0 : at + 1 >= d->index_count) return kAsfNoPacket;
+            at = back ? at - 1 : at + 1;
+            if (!read_entry_at(d, at, &e)) return kAsfNoPacket;
+        } while (e.packet_number == packet);
+        packet = e.packet_number;
+        t = get_packet_pts_with_number(d, packet);
+        if (t == -1) return kAsfNoPacket;
+    }
     *pts = t;
     return packet;
 }

@@ -1,9 +1,13 @@
 // The search without index: three interpolation probes narrow the packet
-// range around the target, a fourth gives the start of a packet-by-packet
-// scan, which walks forward until it has times on both sides of the target,
-// turning back to walk earlier packets when it first meets a later time.
+// range around the target (a probe that meets nothing before the end of the
+// data ends the range at its start), a fourth gives the start of a
+// packet-by-packet scan, which walks forward until it has times on both
+// sides of the target, turning back to walk earlier packets when it first
+// meets a later time, or when it reaches the end without an answer on the
+// asked side.
 #include "asf_seek.h"
 
+#include "asf_packet.h"
 #include "asf_timestamp.h"
 #include "dprintf.h"
 #include "streaming.h"
@@ -70,59 +74,90 @@ uint64_t asf_find_packet_with_type(asf_demuxer_st* d, int dir, int64_t* pts,
         asf_packet_st cursor{};
         for (;;) {  // one payload per step; leaving the loop starts the next pass
             int64_t t = -1;
-            if (get_packet_pts(d, &cursor, &t, target_type) != HOVA_OK) return kAsfNoPacket;
-            if (t != -1) {
-                if (single_probe) {
-                    prev = next = {curr, t};
-                    got_forward = got_backward = true;
-                    goto finish;
-                }
-                if (narrowing > 0) {
-                    if (t < target) {
-                        lower = curr;
-                        start_time = t;
-                    } else {
-                        upper = curr;
-                        stop_time = t;
+            const int r = get_packet_pts(d, &cursor, &t, target_type);
+            bool data_end = false;
+            if (r != HOVA_OK) {
+                // Where nothing counts the packets the input's end is the
+                // data's end; anything else ends the search.
+                if (r != HOVA_EndOfStream || cursor.num_payloads != 0 || !asf_packets_unbounded(d))
+                    return kAsfNoPacket;
+                data_end = true;
+            }
+            if (!data_end) {
+                if (t != -1) {
+                    if (single_probe) {
+                        prev = next = {curr, t};
+                        got_forward = got_backward = true;
+                        goto finish;
                     }
-                    --narrowing;
-                    break;
+                    if (narrowing > 0) {
+                        if (t < target) {
+                            lower = curr;
+                            start_time = t;
+                        } else {
+                            upper = curr;
+                            stop_time = t;
+                        }
+                        --narrowing;
+                        break;
+                    }
+                    if (t < target) {
+                        got_backward = true;
+                        prev = {curr, t};
+                    } else if (t == target) {
+                        prev = next = {curr, t};
+                        got_forward = true;
+                        goto finish;
+                    } else {
+                        got_forward = true;
+                        next = {curr, t};
+                    }
+                    // Walking back, the first earlier time met is the one.
+                    if (got_backward && (got_forward || backward)) goto finish;
                 }
-                if (t < target) {
-                    got_backward = true;
-                    prev = {curr, t};
-                } else if (t == target) {
-                    prev = next = {curr, t};
-                    got_forward = true;
-                    goto finish;
-                } else {
-                    got_forward = true;
-                    next = {curr, t};
-                }
-                if (got_forward && got_backward) goto finish;
-            }
-            if (cursor.num_payloads > 0) continue;
+                if (cursor.num_payloads > 0) continue;
 
-            if (backward) {
-                if (curr == 0) {
-                    prev = {0, 0};
-                    goto finish;
+                if (backward) {
+                    if (curr == 0) {
+                        prev = {0, 0};
+                        goto finish;
+                    }
+                    --curr;
+                    (void)cb->cb_seek64(cb, -2 * static_cast<cb_off_t>(d->packet_size), CB_SEEK_CUR);
+                    continue;
                 }
-                --curr;
-                (void)cb->cb_seek64(cb, -2 * static_cast<cb_off_t>(d->packet_size), CB_SEEK_CUR);
-            } else if (got_forward) {
-                // A later time and no earlier one yet: walk back from the start.
-                backward = true;
-                curr = init;
-                (void)cb->cb_seek64(cb, static_cast<cb_off_t>(asf_packet_position(d, curr)),
-                                    CB_SEEK_SET);
-            } else {
-                ++curr;
+                if (got_forward) {
+                    // A later time and no earlier one yet: walk back from the start.
+                    backward = true;
+                    curr = init;
+                    (void)cb->cb_seek64(cb, static_cast<cb_off_t>(asf_packet_position(d, curr)),
+                                        CB_SEEK_SET);
+                    continue;
+                }
+                if (++curr < d->num_packets) continue;
             }
-            if (curr >= d->num_packets) {
-                if (dir == HOVA_SEEK_FORWARD ? !got_forward : !got_backward) return kAsfNoPacket;
-                goto finish;
+
+            // A walk ran off the end of the data (going back, only an input
+            // that ends before its packets do gets here).
+            if (backward) {
+                if (dir == HOVA_SEEK_FORWARD ? got_forward : got_backward) goto finish;
+                return kAsfNoPacket;
             }
+            if (narrowing > 0) {
+                // Nothing to find from this probe's start on: the range ends there.
+                upper = init;
+                curr = lower;
+                --narrowing;
+                break;
+            }
+            if (dir == HOVA_SEEK_FORWARD ? got_forward : got_backward) goto finish;
+            // Nothing on the asked side from the scan's start to the end: the
+            // answer, if any, lies before it. Walk back from the start.
+            backward = true;
+            got_backward = false;
+            curr = init;
+            cursor = asf_packet_st{};
+            (void)cb->cb_seek64(cb, static_cast<cb_off_t>(asf_packet_position(d, curr)), CB_SEEK_SET);
         }
     }
 

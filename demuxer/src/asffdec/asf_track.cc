@@ -17,6 +17,10 @@ void leave_separate_parsing(asf_demuxer_st* d, sys_stream_type_et removed) {
         d->cur_data_packet = remaining->cache_data_packet;
         d->cur_packets = d->cur_data_packet.num;
         (void)asf_seek_to_packet_with_parsed(d, &d->cur_data_packet);
+        // A packet the removed stream's cursor abandoned is no business of
+        // this cursor: re-aiming at its packet start would read again what
+        // it already delivered.
+        d->resync = 0;
     }
     d->parse_mode = PARSE_SEQ;
     d->accept_stream_type = HOVA_STREAM_NONE;
