@@ -50,13 +50,10 @@ protected:
     bool opened = false;
 };
 
-TEST(MsftTables, MapsFormatTagsToAudioCodecs) {
-    const struct {
-        int tag;
-        HOVAAudioType codec;
-    } cases[] = {
-        // A representative of each codec family, neighbours of the WMA run,
-        // and tags outside the table.
+TEST(MsftTables, MapFormatTagsAndFourccsToCodecs) {
+    // A representative of each codec family, neighbours of the WMA run, and
+    // tags outside the table.
+    const std::pair<int, HOVAAudioType> tags[] = {
         {0x0001, CLIP_AUDIO_TYPE_LPCM},     {0x0002, CLIP_AUDIO_TYPE_ADPCM},
         {0x0006, CLIP_AUDIO_TYPE_PCM},      {0x0055, CLIP_AUDIO_TYPE_MP3},
         {0x2000, CLIP_AUDIO_TYPE_AC3},      {0x706D, CLIP_AUDIO_TYPE_AAC},
@@ -65,21 +62,9 @@ TEST(MsftTables, MapsFormatTagsToAudioCodecs) {
         {0x0164, CLIP_AUDIO_TYPE_UNKNOWN},  {0x0000, CLIP_AUDIO_TYPE_UNKNOWN},
         {0xFFFE, CLIP_AUDIO_TYPE_UNKNOWN},  {0x10161, CLIP_AUDIO_TYPE_UNKNOWN},
     };
-    for (const auto& c : cases)
-        EXPECT_EQ(sys_msft_format_tag_to_acodec(c.tag), c.codec) << std::hex << c.tag;
-}
-
-TEST(MsftTables, MapsFourccInFileOrderAndCase) {
-    auto fcc = [](const char* s) {
-        uint32_t v = 0;
-        std::memcpy(&v, s, 4);
-        return v;
-    };
-    const struct {
-        const char* cc;
-        HOVAVideoType codec;
-    } cases[] = {
-        // Case matters; a few codes of each family; reversed byte order is no code.
+    for (const auto& [tag, codec] : tags) EXPECT_EQ(sys_msft_format_tag_to_acodec(tag), codec) << std::hex << tag;
+    // Case matters; reversed byte order is no code.
+    const std::pair<const char*, HOVAVideoType> fourccs[] = {
         {"WVC1", CLIP_VIDEO_TYPE_WVC1}, {"wvc1", CLIP_VIDEO_TYPE_UNKNOWN},
         {"WMV3", CLIP_VIDEO_TYPE_WMV3}, {"MP43", CLIP_VIDEO_TYPE_DIV3},
         {"div3", CLIP_VIDEO_TYPE_DIV3}, {"Div3", CLIP_VIDEO_TYPE_UNKNOWN},
@@ -88,20 +73,16 @@ TEST(MsftTables, MapsFourccInFileOrderAndCase) {
         {"avc1", CLIP_VIDEO_TYPE_AVC1}, {"AVC1", CLIP_VIDEO_TYPE_UNKNOWN},
         {"hevc", CLIP_VIDEO_TYPE_HEVC}, {"1CVW", CLIP_VIDEO_TYPE_UNKNOWN},
     };
-    for (const auto& c : cases)
-        EXPECT_EQ(sys_msft_fourcc_to_vcodec(fcc(c.cc)), c.codec) << std::string(c.cc, 4);
-}
-
-TEST(MsftTables, PcmLikeCodecs) {
+    for (const auto& [cc, codec] : fourccs) {
+        uint32_t v = 0;
+        std::memcpy(&v, cc, 4);
+        EXPECT_EQ(sys_msft_fourcc_to_vcodec(v), codec) << std::string(cc, 4);
+    }
     sys_stream_st s{};
-    const struct {
-        int codec;
-        int pcm;
-    } cases[] = {{CLIP_AUDIO_TYPE_ADPCM, 1}, {CLIP_AUDIO_TYPE_LPCM, 1}, {CLIP_AUDIO_TYPE_PCM, 1},
-                 {CLIP_AUDIO_TYPE_WMA2, 0},  {CLIP_AUDIO_TYPE_AAC, 0}};
-    for (const auto& c : cases) {
-        s.codec_type = c.codec;
-        EXPECT_EQ(sys_is_codec_PCM(&s), c.pcm) << c.codec;
+    for (const auto& [codec, pcm] : {std::pair{CLIP_AUDIO_TYPE_ADPCM, 1}, {CLIP_AUDIO_TYPE_LPCM, 1},
+                                     {CLIP_AUDIO_TYPE_PCM, 1}, {CLIP_AUDIO_TYPE_WMA2, 0}, {CLIP_AUDIO_TYPE_AAC, 0}}) {
+        s.codec_type = codec;
+        EXPECT_EQ(sys_is_codec_PCM(&s), pcm) << codec;
     }
 }
 
