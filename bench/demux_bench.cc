@@ -53,17 +53,8 @@ std::string g_only;
 int g_block_size = 32768;  // the raw input's block_size
 int g_ring_size = 1 << 20;  // what the host passes to open_file
 
-enum class Mode { Cache, None, Ring, Thread };
-constexpr Mode kModes[] = {Mode::Cache, Mode::None, Mode::Ring, Mode::Thread};
-const char* mode_name(Mode m) {
-    switch (m) {
-        case Mode::Cache: return "cache";
-        case Mode::None: return "none";
-        case Mode::Ring: return "ring";
-        case Mode::Thread: return "thread";
-    }
-    return "?";
-}
+using Mode = host::Buffering;
+constexpr auto& kModes = host::kBufferings;
 
 struct Result {
     double seconds = 0;  // per run
@@ -101,10 +92,7 @@ using plimo_bench::LeanHost;
 template <typename Host>
 Result play_plugin(const Bytes& file, Mode mode, Host& host, const hova_callback_st* table,
                    uint64_t* commits) {
-    host::InputOptions in;
-    in.disable_cache = mode == Mode::None;
-    in.rbuf_mode = (mode == Mode::Ring || mode == Mode::Thread) ? CBIO_APPLY_RBUF : CBIO_NO_RBUF;
-    in.use_thread = mode == Mode::Thread;
+    host::InputOptions in = host::with_buffering(mode);
     in.block_size = g_block_size;
     auto input = host::RawInput::borrow_memory(file.data(), file.size(), in);
     host::ContextBuffer buf(static_cast<size_t>(hova_asff_demuxer.min_context_size));
@@ -282,7 +270,7 @@ void report(const std::string& name, size_t size) {
     };
     std::vector<Row> rows;
     for (Mode m : kModes)
-        rows.push_back({std::string("plimo lean, ") + mode_name(m), static_cast<int>(m),
+        rows.push_back({std::string("plimo lean, ") + host::buffering_name(m), static_cast<int>(m),
                         [&file, m] { return plugin_lean(file, m); }});
     rows.push_back({"plimo ref host, cache", -1, [&file] { return plugin_reference(file, Mode::Cache); }});
     const double bytes = static_cast<double>(file.size());

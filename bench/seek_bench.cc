@@ -43,17 +43,8 @@ int g_block = 32768;
 constexpr int kRing = 1 << 20;
 constexpr int kPasses = 3;
 
-enum class Mode { Cache, None, Ring, Thread };
-constexpr Mode kModes[] = {Mode::Cache, Mode::None, Mode::Ring, Mode::Thread};
-const char* mode_name(Mode m) {
-    switch (m) {
-        case Mode::Cache: return "cache";
-        case Mode::None: return "none";
-        case Mode::Ring: return "ring";
-        case Mode::Thread: return "thread";
-    }
-    return "?";
-}
+using Mode = host::Buffering;
+constexpr auto& kModes = host::kBufferings;
 
 bool read_file(const std::string& path, Bytes* out) {
     FILE* f = std::fopen(path.c_str(), "rb");
@@ -109,9 +100,7 @@ Figures plugin_seeks(const Bytes& file, const std::vector<int64_t>& targets, int
         LeanHost host;
         host::InputOptions in;
         in.block_size = g_block;
-        in.disable_cache = mode == Mode::None;
-        in.rbuf_mode = (mode == Mode::Ring || mode == Mode::Thread) ? CBIO_APPLY_RBUF : CBIO_NO_RBUF;
-        in.use_thread = mode == Mode::Thread;
+        in = host::with_buffering(mode, in);
         auto input = host::RawInput::borrow_memory(file.data(), file.size(), in);
         host::ContextBuffer buf(static_cast<size_t>(hova_asff_demuxer.min_context_size));
         void* ctx = nullptr;
@@ -295,7 +284,7 @@ void run_file(const std::string& name, const Bytes& file, int count) {
         for (Mode m : kModes) {
             const Figures f = m == Mode::Cache ? ours : plugin_seeks(*bytes, targets, HOVA_SEEK_BACKWARD, true, m);
             sum.modes[static_cast<int>(m)] = f;
-            const std::string part = std::string("+key ") + mode_name(m);
+            const std::string part = std::string("+key ") + host::buffering_name(m);
             print("plimo", what, part.c_str(), f);
             if (f.ok) std::printf("%-10s %-46s %-14s %8.1f KB peak memory\n", "", "", "", static_cast<double>(f.peak) / 1024.0);
         }

@@ -9,6 +9,23 @@
 
 namespace host {
 
+const char* buffering_name(Buffering b) {
+    switch (b) {
+        case Buffering::Cache: return "cache";
+        case Buffering::None: return "none";
+        case Buffering::Ring: return "ring";
+        case Buffering::Thread: return "thread";
+    }
+    return "?";
+}
+
+InputOptions with_buffering(Buffering b, InputOptions base) {
+    base.disable_cache = b == Buffering::None;
+    base.rbuf_mode = (b == Buffering::Ring || b == Buffering::Thread) ? CBIO_APPLY_RBUF : CBIO_NO_RBUF;
+    base.use_thread = b == Buffering::Thread;
+    return base;
+}
+
 RawInput::RawInput() {
     holder_.owner = this;
     io_.read = &RawInput::op_read;

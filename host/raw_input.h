@@ -26,6 +26,17 @@ struct InputOptions {
     int ring_size = 1048576;       // what the host passes to open_file
 };
 
+// The four bufferings a host chooses between for the plug-in's reader: the
+// file cache, none, the ring filled on the caller's thread, and the ring
+// filled by the streaming thread.
+enum class Buffering { Cache, None, Ring, Thread };
+inline constexpr Buffering kBufferings[] = {Buffering::Cache, Buffering::None, Buffering::Ring,
+                                            Buffering::Thread};
+// "cache", "none", "ring", "thread".
+const char* buffering_name(Buffering b);
+// `base` with the flags that choose `b`.
+InputOptions with_buffering(Buffering b, InputOptions base = {});
+
 struct InputFaults {
     uint64_t end_after = UINT64_MAX;   // the input ends after this many bytes
     size_t max_read = SIZE_MAX;        // no read returns more than this

@@ -65,14 +65,6 @@ Played play(const std::vector<uint8_t>& file, const host::InputOptions& in, bool
     return out;
 }
 
-host::InputOptions mode(int m) {
-    host::InputOptions in;
-    if (m == 1) in.disable_cache = true;
-    if (m >= 2) in.rbuf_mode = CBIO_APPLY_RBUF;
-    if (m == 3) in.use_thread = true;
-    return in;
-}
-const char* kModeNames[] = {"cache", "none", "ring", "ring+thread"};
 
 struct RefPacket {
     int64_t pts_ms;
@@ -164,14 +156,14 @@ TEST_P(CorpusDelivery, FramesMatchTheReferenceInEveryBufferingMode) {
     std::ifstream refin(path + ".ffprobe.json");
     const bool has_ref = refin.good();
 
-    const Played base = play(file, mode(0), true);
+    const Played base = play(file, host::with_buffering(host::Buffering::Cache), true);
     EXPECT_EQ(base.blocks_after_close, 0u);
     EXPECT_EQ(base.protocol_errors, 0u);
     for (int m = 1; m < 4; ++m) {
-        SCOPED_TRACE(kModeNames[m]);
-        const Played other = play(file, mode(m));
+        SCOPED_TRACE(host::buffering_name(host::kBufferings[m]));
+        const Played other = play(file, host::with_buffering(host::kBufferings[m]));
         std::string why;
-        EXPECT_TRUE(same_events(base, other, &why)) << kModeNames[m] << ": " << why;
+        EXPECT_TRUE(same_events(base, other, &why)) << host::buffering_name(host::kBufferings[m]) << ": " << why;
         EXPECT_EQ(other.blocks_after_close, 0u);
     }
     if (!has_ref) {
@@ -279,11 +271,11 @@ TEST(CorpusDelivery, FileChangedByOneFieldPlaysAsTheOriginal) {
         ASSERT_TRUE(testenv::read_file(path, &file));
         const std::vector<uint8_t> changed = c.edit(file);
         ASSERT_FALSE(changed.empty());
-        const Played base = play(file, mode(0));
+        const Played base = play(file, host::with_buffering(host::Buffering::Cache));
         ASSERT_EQ(base.open_rc, HOVA_OK);
         for (int m = 0; m < 4; ++m) {
-            SCOPED_TRACE(kModeNames[m]);
-            const Played other = play(changed, mode(m));
+            SCOPED_TRACE(host::buffering_name(host::kBufferings[m]));
+            const Played other = play(changed, host::with_buffering(host::kBufferings[m]));
             std::string why;
             EXPECT_TRUE(same_events(base, other, &why)) << why;
             EXPECT_EQ(other.blocks_after_close, 0u);

@@ -59,14 +59,6 @@ host::LocalWebServer* web_server(std::string* why) {
 
 std::string base_name(const std::string& path) { return path.substr(path.find_last_of('/') + 1); }
 
-host::InputOptions mode(int m) {
-    host::InputOptions in;
-    if (m == 1) in.disable_cache = true;
-    if (m >= 2) in.rbuf_mode = CBIO_APPLY_RBUF;
-    if (m == 3) in.use_thread = true;
-    return in;
-}
-const char* const kModeNames[] = {"cache", "none", "ring", "ring+thread"};
 
 std::string describe(const HostEvent& e) {
     std::ostringstream s;
@@ -147,14 +139,14 @@ TEST(HttpInput, EveryCorpusFileByUrlGivesTheFileEventsInEveryMode) {
     REQUIRE_WEB_SERVER(server);
     for (const std::string& path : testenv::corpus_files()) {
         for (int m = 0; m < 4; ++m) {
-            SCOPED_TRACE(base_name(path) + " " + kModeNames[m]);
-            auto input = by_url(server->url(base_name(path)), mode(m));
+            SCOPED_TRACE(base_name(path) + " " + host::buffering_name(host::kBufferings[m]));
+            auto input = by_url(server->url(base_name(path)), host::with_buffering(host::kBufferings[m]));
             if (!input) continue;
             EXPECT_EQ(input->io()->streaming, 1);
             EXPECT_EQ(input->io()->seekable, 1);
             EXPECT_EQ(input->io()->input_size, input->size());
             const Played net = play(std::move(input));
-            const Played local = play(by_file(path, mode(m)));
+            const Played local = play(by_file(path, host::with_buffering(host::kBufferings[m])));
             EXPECT_EQ(net.open_rc, local.open_rc);
             EXPECT_EQ(net.last, local.last);
             EXPECT_EQ(net.events, local.events);
@@ -221,7 +213,7 @@ TEST(HttpInput, SeekCostsOneRequest) {
 TEST(HttpInput, SeekByUrlLandsWhereTheFileLands) {
     REQUIRE_WEB_SERVER(server);
     for (const std::string& path : testenv::corpus_files()) {
-        const Played whole = play(by_file(path, mode(0)));
+        const Played whole = play(by_file(path, host::with_buffering(host::Buffering::Cache)));
         if (whole.open_rc != HOVA_OK) continue;
         // Halfway through by the last media frame's time.
         int64_t last_pts = 0;
@@ -235,9 +227,9 @@ TEST(HttpInput, SeekByUrlLandsWhereTheFileLands) {
         }
         if (last_pts <= 0) continue;
         for (int m = 0; m < 4; ++m) {
-            SCOPED_TRACE(base_name(path) + " " + kModeNames[m]);
-            const Played net = play(by_url(server->url(base_name(path)), mode(m)), last_pts / 2, 200);
-            const Played local = play(by_file(path, mode(m)), last_pts / 2, 200);
+            SCOPED_TRACE(base_name(path) + " " + host::buffering_name(host::kBufferings[m]));
+            const Played net = play(by_url(server->url(base_name(path)), host::with_buffering(host::kBufferings[m])), last_pts / 2, 200);
+            const Played local = play(by_file(path, host::with_buffering(host::kBufferings[m])), last_pts / 2, 200);
             EXPECT_EQ(net.seek_rc, local.seek_rc);
             EXPECT_EQ(net.seek_pts, local.seek_pts);
             EXPECT_EQ(net.events, local.events);
@@ -251,12 +243,12 @@ TEST(HttpInput, ServerWithoutRangesPlaysInOnePassAndRefusesSeeks) {
     REQUIRE_WEB_SERVER(server);
     REQUIRE_CORPUS_FILE(path, "moon-elephants-dream-first-minute.wmv");
     for (int m = 0; m < 4; ++m) {
-        SCOPED_TRACE(kModeNames[m]);
-        auto input = by_url(server->url(base_name(path), false), mode(m));
+        SCOPED_TRACE(host::buffering_name(host::kBufferings[m]));
+        auto input = by_url(server->url(base_name(path), false), host::with_buffering(host::kBufferings[m]));
         if (!input) continue;
         EXPECT_FALSE(input->http()->ranges());
         EXPECT_EQ(input->io()->seekable, 0);
-        host::InputOptions in = mode(m);
+        host::InputOptions in = host::with_buffering(host::kBufferings[m]);
         in.seekable = false;
         const Played net = play(std::move(input));
         const Played local = play(by_file(path, in));
@@ -264,7 +256,7 @@ TEST(HttpInput, ServerWithoutRangesPlaysInOnePassAndRefusesSeeks) {
         EXPECT_EQ(net.requests, 1u);
         EXPECT_EQ(net.blocks, 0u);
 
-        const Played seek = play(by_url(server->url(base_name(path), false), mode(m)), 20000000, 50);
+        const Played seek = play(by_url(server->url(base_name(path), false), host::with_buffering(host::kBufferings[m])), 20000000, 50);
         EXPECT_NE(seek.seek_rc, HOVA_OK);
         EXPECT_EQ(seek.requests, 1u);
         EXPECT_EQ(seek.blocks, 0u);
@@ -359,11 +351,11 @@ TEST(HttpInput, ConnectionCutHalfwayEndsTheStreamInEveryMode) {
     REQUIRE_CORPUS_FILE(path, "moon-elephants-dream-first-minute.wmv");
     CuttingServer server(testenv::read_file_or_empty(path));
     ASSERT_TRUE(server.ok());
-    const Played whole = play(by_file(path, mode(0)));
+    const Played whole = play(by_file(path, host::with_buffering(host::Buffering::Cache)));
     for (int m = 0; m < 4; ++m) {
-        SCOPED_TRACE(kModeNames[m]);
+        SCOPED_TRACE(host::buffering_name(host::kBufferings[m]));
         const auto t0 = std::chrono::steady_clock::now();
-        const Played cut = play(by_url(server.url(), mode(m)));
+        const Played cut = play(by_url(server.url(), host::with_buffering(host::kBufferings[m])));
         EXPECT_LT(std::chrono::steady_clock::now() - t0, std::chrono::seconds(20));
         ASSERT_EQ(cut.open_rc, HOVA_OK);
         EXPECT_EQ(cut.last, HOVA_EndOfStream);

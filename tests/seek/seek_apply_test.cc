@@ -27,14 +27,6 @@ std::vector<Frame> frames_of(const Player& p) {
     return out;
 }
 
-host::InputOptions buffering(int m) {
-    host::InputOptions in;
-    if (m == 1) in.disable_cache = true;
-    if (m >= 2) in.rbuf_mode = CBIO_APPLY_RBUF;
-    if (m == 3) in.use_thread = true;
-    return in;
-}
-
 TEST(SeekEffect, QueryOrFailedSeekLeavesDeliveryWhereItWas) {
     Clip indexed;
     Clip plain;
@@ -59,10 +51,10 @@ TEST(SeekEffect, QueryOrFailedSeekLeavesDeliveryWhereItWas) {
     for (const Case& c : cases) {
         for (int m = 0; m < 4; ++m) {
             SCOPED_TRACE(testing::Message() << c.what << ", buffering " << m);
-            Player ref(seektest::build(c.clip), buffering(m));
+            Player ref(seektest::build(c.clip), host::with_buffering(host::kBufferings[m]));
             ref.open_or_fail();
             ASSERT_EQ(ref.play(), HOVA_EndOfStream);
-            Player p(seektest::build(c.clip), buffering(m));
+            Player p(seektest::build(c.clip), host::with_buffering(host::kBufferings[m]));
             p.open_or_fail();
             for (int i = 0; i < 33; ++i) p.step();
             int64_t t = c.target;
