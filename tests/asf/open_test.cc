@@ -300,8 +300,9 @@ TEST(Open, CloseReleasesEveryBlock) {
          {"WM/Picture", 1, asfb::picture_value(3, "image/png", "", Bytes(16, 2))}}));
     Opened o = testsupport::open_file(f);
     ASSERT_EQ(o.rc, HOVA_OK);
-    // Reader block, two configurations, cover, title, author, album, genre.
-    EXPECT_EQ(o.session->blocks_outstanding(), 8u);
+    // Reader block, two configurations, cover, title, author, album, genre,
+    // simple index entries.
+    EXPECT_EQ(o.session->blocks_outstanding(), 9u);
     EXPECT_EQ(hova_asff_demuxer.close_file(o.ctx()), HOVA_OK);
     EXPECT_EQ(o.session->blocks_outstanding(), 0u);
     EXPECT_EQ(o.session->callbacks().foreign_frees(), 0u);

@@ -208,6 +208,50 @@ TEST(HttpInput, SeekCostsOneRequest) {
     EXPECT_EQ(input->http()->failure(), "");
 }
 
+// A seek whose index walk meets only entries an earlier seek probed costs at
+// most one request, the jump to its packet, up to its first video frame.
+TEST(HttpInput, SeekOverKnownIndexEntriesCostsOneRequest) {
+    REQUIRE_WEB_SERVER(server);
+    REQUIRE_CORPUS_FILE(path, "moon-elephants-dream-first-minute.wmv");
+    for (int m = 0; m < 4; ++m) {
+        SCOPED_TRACE(kModeNames[m]);
+        auto input = by_url(server->url(base_name(path)), mode(m));
+        ASSERT_TRUE(input);
+        const host::HttpSource* http = input->http();
+        host::Session s(&hova_asff_demuxer, std::move(input));
+        ASSERT_EQ(s.open(), HOVA_OK);
+        void* ctx = s.context();
+        hova_stream_type_et t = HOVA_STREAM_NONE;
+        int bs = 0;
+        int64_t pts = 0;
+        (void)hova_asff_demuxer.get_data(ctx, &t, &bs, &pts);  // configuration records
+        int64_t answers[3] = {40000000, 10000000, 40000000};
+        uint64_t cost = 0;
+        for (int64_t& target : answers) {
+            const uint64_t before = http->stats().requests;
+            ASSERT_EQ(hova_asff_demuxer.seek_time(ctx, HOVA_SEEK_BACKWARD, &target, 0), HOVA_OK);
+            const size_t first = s.callbacks().events().size();
+            bool framed = false;
+            for (int calls = 0; !framed && calls < 1000; ++calls) {
+                const int rc = hova_asff_demuxer.get_data(ctx, &t, &bs, &pts);
+                for (size_t i = first; i < s.callbacks().events().size(); ++i)
+                    framed = framed || (s.callbacks().events()[i].kind == EventKind::Commit &&
+                                        s.callbacks().events()[i].packet_type == 0);
+                if (rc != HOVA_OK && rc != HOVA_TryAgain) break;
+            }
+            cost = http->stats().requests - before;
+        }
+        EXPECT_EQ(answers[2], answers[0]);
+        // Unbuffered, exactly the jump; the buffered modes may still hold the packet.
+        if (m == 1)
+            EXPECT_EQ(cost, 1u) << "requests of the third seek";
+        else
+            EXPECT_LE(cost, 1u) << "requests of the third seek";
+        s.close();
+        EXPECT_EQ(s.blocks_outstanding(), 0u);
+    }
+}
+
 // The plug-in's seek over the network lands where it lands from the file and
 // delivers the same frames after it.
 TEST(HttpInput, SeekByUrlLandsWhereTheFileLands) {

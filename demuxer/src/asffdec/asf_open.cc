@@ -8,6 +8,7 @@
 #include "asf_io.h"
 #include "asf_objects.h"
 #include "asf_packet.h"
+#include "asf_seek.h"
 #include "byte_reader.h"
 #include "dprintf.h"
 #include "streaming.h"
@@ -89,6 +90,7 @@ void asf_free_memory(asf_demuxer_st* d) {
     sys_free(s, d->author.payload);
     sys_free(s, d->albumTitle.payload);
     sys_free(s, d->genre);
+    asf_release_index(d);
 }
 
 void asf_parse_index(asf_demuxer_st* d) {
@@ -106,6 +108,7 @@ void asf_parse_index(asf_demuxer_st* d) {
             d->index_count = load_le<uint32_t>(h + si::kIndexCount);
             d->index_packet = cb_tell64(cb);
             d->index_time_interval = load_le<uint64_t>(h + si::kTimeInterval) / 10;
+            asf_hold_index(d);
             break;  // only the first simple index is used
         }
         const auto size = static_cast<cb_off_t>(load_le<uint64_t>(h + asf::kObjSize));

@@ -10,6 +10,20 @@
 // What the packet searches return when they cannot answer.
 inline constexpr uint64_t kAsfNoPacket = UINT64_MAX;
 
+// Most simple index entries held in memory: 12 bytes each (packet number and
+// key-frame time) in one block of at most 64 KiB, 91 minutes at one entry a
+// second.
+inline constexpr uint32_t kAsfMaxHeldIndexEntries = (65536 - 8) / 12;
+
+// With the reader on the simple index entries, keeps their packet numbers
+// (and the key-frame times seeks find for them) in one host block when there
+// are at most kAsfMaxHeldIndexEntries of them and the host grants it;
+// otherwise (or on a short read) the index walk reads entries from the input
+// and probes every time. Moves the reader.
+void asf_hold_index(asf_demuxer_st* d);
+// Gives the held entries back to the host (nothing when none are held).
+void asf_release_index(asf_demuxer_st* d);
+
 // Packet of the video key frame for *pts through the simple index; *pts
 // becomes that key frame's time. kAsfNoPacket when the index cannot answer.
 uint64_t asf_find_packet_by_index(asf_demuxer_st* d, int dir, int64_t* pts);
