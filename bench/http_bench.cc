@@ -46,16 +46,6 @@ namespace {
 using Clock = std::chrono::steady_clock;
 using plimo_bench::LeanHost;
 
-const char* const kModes[] = {"cache", "none", "ring", "ring+thread"};
-
-host::InputOptions mode_options(int m) {
-    host::InputOptions in;
-    if (m == 1) in.disable_cache = true;
-    if (m >= 2) in.rbuf_mode = CBIO_APPLY_RBUF;
-    if (m == 3) in.use_thread = true;
-    return in;
-}
-
 double ms_since(Clock::time_point t0) {
     return std::chrono::duration<double, std::milli>(Clock::now() - t0).count();
 }
@@ -81,7 +71,7 @@ struct Opened {
 
 bool open_url(const std::string& url, int m, Opened* o) {
     std::string why;
-    o->input = host::RawInput::from_url(url, mode_options(m), &why);
+    o->input = host::RawInput::from_url(url, host::with_buffering(host::kBufferings[m]), &why);
     if (!o->input) {
         std::fprintf(stderr, "%s: %s\n", url.c_str(), why.c_str());
         return false;
@@ -333,7 +323,7 @@ int main(int argc, char** argv) {
     };
     for (FileRuns& f : all) {
         std::fprintf(stderr, "%s...\n", f.name.c_str());
-        for (int m = 0; m < 4; ++m) f.play.emplace_back(kModes[m], plugin_play(url(f.name, "play"), m));
+        for (int m = 0; m < 4; ++m) f.play.emplace_back(host::buffering_name(host::kBufferings[m]), plugin_play(url(f.name, "play"), m));
 #ifdef PLIMO_HAVE_LIBAV
         f.play.emplace_back("lavf", lavf_play(url(f.name, "lavf-play")));
 #endif
@@ -345,7 +335,7 @@ int main(int argc, char** argv) {
         std::vector<int64_t> targets(static_cast<size_t>(seeks) + 1);
         for (int64_t& t : targets) t = pick(rng);
         for (int m = 0; m < 4; ++m)
-            f.seek.emplace_back(kModes[m], plugin_seek(url(f.name, "warm"), m, targets, false),
+            f.seek.emplace_back(host::buffering_name(host::kBufferings[m]), plugin_seek(url(f.name, "warm"), m, targets, false),
                                 plugin_seek(url(f.name, "seek"), m, targets, true));
 #ifdef PLIMO_HAVE_LIBAV
         f.seek.emplace_back("lavf", lavf_seek(url(f.name, "lavf-warm"), targets, false),

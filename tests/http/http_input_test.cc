@@ -214,8 +214,8 @@ TEST(HttpInput, SeekOverKnownIndexEntriesCostsOneRequest) {
     REQUIRE_WEB_SERVER(server);
     REQUIRE_CORPUS_FILE(path, "moon-elephants-dream-first-minute.wmv");
     for (int m = 0; m < 4; ++m) {
-        SCOPED_TRACE(kModeNames[m]);
-        auto input = by_url(server->url(base_name(path)), mode(m));
+        SCOPED_TRACE(host::buffering_name(host::kBufferings[m]));
+        auto input = by_url(server->url(base_name(path)), host::with_buffering(host::kBufferings[m]));
         ASSERT_TRUE(input);
         const host::HttpSource* http = input->http();
         host::Session s(&hova_asff_demuxer, std::move(input));
