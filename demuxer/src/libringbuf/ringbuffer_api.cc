@@ -237,6 +237,15 @@ uint32_t sys_ringbuffer_ahead(const sys_ringbuffer* rb) {
     return held > rb->unreleased ? held - rb->unreleased : 0;
 }
 
+uint32_t sys_ringbuffer_held_span(const sys_ringbuffer* rb, const uint8_t** at) {
+    const uint32_t ahead = sys_ringbuffer_ahead(rb);
+    uint32_t start = rb->pread + rb->unreleased;
+    if (start >= rb->size) start -= rb->size;
+    *at = rb->data + start;
+    const uint32_t to_end = rb->size - start;
+    return ahead < to_end ? ahead : to_end;
+}
+
 int32_t sys_ringbuffer_peek_held(sys_ringbuffer* rb, uint8_t* dst, uint32_t len) {
     // pkt_cnt is stored (release) after the producer wrote the bytes it
     // counts, and the acquire load in ahead() makes them visible here.

@@ -87,6 +87,10 @@ uint32_t sys_ringbuffer_history(sys_ringbuffer* rb);
 int32_t sys_ringbuffer_take_held(sys_ringbuffer* rb, uint8_t* dst, uint32_t len);
 int32_t sys_ringbuffer_peek_held(sys_ringbuffer* rb, uint8_t* dst, uint32_t len);
 void sys_ringbuffer_settle(sys_ringbuffer* rb);
+/* The held bytes past what the consumer took that follow each other in the
+ * storage (up to where it wraps), at *at; consumer only. They stay as they
+ * are until the consumer releases them. */
+uint32_t sys_ringbuffer_held_span(const sys_ringbuffer* rb, const uint8_t** at);
 /* Bytes held past what the consumer took; consumer only. */
 uint32_t sys_ringbuffer_ahead(const sys_ringbuffer* rb);
 void sys_ringbuffer_settle_locked(sys_ringbuffer* rb);

@@ -30,6 +30,12 @@ bool rewind_ring(cb_buffer_st* cb, cb_off_t target) {
     return true;
 }
 
+uint32_t cb_ring_span(cb_buffer_st* cb, const uint8_t** at) {
+    sys_ringbuffer* rb = cb->active_rbuf;
+    if (!rb || cb->buffer_type != CB_STREAM_RBUF || side_active(cb) || rb_paused(rb)) return 0;
+    return sys_ringbuffer_held_span(rb, at);
+}
+
 void init_multi_thread_plugin(cb_buffer_st* cb) {
     cb->cb_read = cb_read_multi;
     cb->cb_peek = cb_peek_multi;
