@@ -207,6 +207,20 @@ int try_from_peek(cb_buffer_st* cb, int32_t window, Parse parse) {
             }
         }
     }
+    // A ring holds them in place too, up to where its storage wraps.
+    if (cb->buffer_type == CB_STREAM_RBUF) {
+        const uint8_t* at = nullptr;
+        const uint32_t held = cb_ring_span(cb, &at);
+        if (held > 0) {
+            PeekSource src{at, held};
+            const int r = parse(src);
+            if (!src.incomplete) {
+                if (cb->cb_seek64(cb, static_cast<cb_off_t>(src.pos), CB_SEEK_CUR) == -1)
+                    return HOVA_EndOfStream;
+                return r;
+            }
+        }
+    }
     uint8_t buf[kPacketHeaderPeek > kPayloadHeaderPeek ? kPacketHeaderPeek : kPayloadHeaderPeek];
     const int32_t got = cb->cb_peek(cb, buf, window);
     if (got != window) return -1;

@@ -77,6 +77,7 @@ void sys_ringbuffer_init(sys_ringbuffer* rb, uint8_t* data, uint32_t len) {
     rb->hist = 0;
     rb->taken = 0;
     rb->retry_read = 0;
+    rb->unreleased = 0;
     pthread_mutex_init(&rb->ring_mutex, nullptr);
     pthread_cond_init(&rb->ring_avail_cond, nullptr);
     pthread_cond_init(&rb->ring_free_cond, nullptr);
@@ -93,6 +94,7 @@ void sys_ringbuffer_close(sys_ringbuffer* rb) {
     store_eos(rb, 1);
     store_cnt(rb, 0);
     rb->pread = rb->pwrite;
+    rb->unreleased = 0;
     rb->error = 0;
     rb->hist = 0;
     pthread_cond_signal(&rb->ring_avail_cond);
@@ -123,6 +125,7 @@ void sys_ringbuffer_flush(sys_ringbuffer* rb) {
     store_cnt(rb, 0);
     rb->error = 1;
     rb->pread = rb->pwrite;
+    rb->unreleased = 0;
     rb->hist = 0;
     pthread_cond_signal(&rb->ring_avail_cond);
     pthread_cond_signal(&rb->ring_free_cond);
@@ -133,6 +136,7 @@ void sys_ringbuffer_reset_locked(sys_ringbuffer* rb) {
     store_cnt(rb, 0);
     rb->pread = 0;
     rb->pwrite = 0;
+    rb->unreleased = 0;
     rb->hist = 0;
     rb->taken = 0;
     store_eos(rb, 0);
@@ -187,9 +191,87 @@ int32_t sys_ringbuffer_read_peek(sys_ringbuffer* rb, uint8_t* dst, uint32_t len,
 
 namespace {
 
+void release_locked(sys_ringbuffer* rb, uint32_t len) {
+    uint32_t p = rb->pread + len;
+    if (p >= rb->size) p -= rb->size;
+    rb->pread = p;
+    store_cnt(rb, load_cnt(rb) - len);
+    // Released bytes stay readable until the producer needs their room.
+    rb->hist += len;
+    trim_history(rb);
+    rb->taken = rb->taken > UINT32_MAX - len ? UINT32_MAX : rb->taken + len;
+    if (rb->wsize_req != 0 && sys_ringbuffer_free_internal(rb) >= rb->wsize_req)
+        pthread_cond_signal(&rb->ring_free_cond);
+    rb->srlock = 0;
+}
+
+// Bytes a consumer takes without the lock before it releases them in one
+// critical section: small enough that the producer soon gets the room back,
+// large enough that the lock is rare next to the parser's small reads.
+constexpr uint32_t kReleaseBatch = 16 * 1024;
+
+uint32_t release_batch(const sys_ringbuffer* rb) {
+    const uint32_t quarter = rb->size / 4;
+    if (quarter == 0) return 1;
+    return quarter < kReleaseBatch ? quarter : kReleaseBatch;
+}
+
+}  // namespace
+
+void sys_ringbuffer_settle_locked(sys_ringbuffer* rb) {
+    if (rb->unreleased == 0) return;
+    const uint32_t n = rb->unreleased;
+    rb->unreleased = 0;
+    release_locked(rb, n);
+}
+
+void sys_ringbuffer_settle(sys_ringbuffer* rb) {
+    if (rb->unreleased == 0) return;
+    pthread_mutex_lock(&rb->ring_mutex);
+    sys_ringbuffer_settle_locked(rb);
+    pthread_mutex_unlock(&rb->ring_mutex);
+}
+
+uint32_t sys_ringbuffer_ahead(const sys_ringbuffer* rb) {
+    const uint32_t held = load_cnt(rb);
+    return held > rb->unreleased ? held - rb->unreleased : 0;
+}
+
+uint32_t sys_ringbuffer_held_span(const sys_ringbuffer* rb, const uint8_t** at) {
+    const uint32_t ahead = sys_ringbuffer_ahead(rb);
+    uint32_t start = rb->pread + rb->unreleased;
+    if (start >= rb->size) start -= rb->size;
+    *at = rb->data + start;
+    const uint32_t to_end = rb->size - start;
+    return ahead < to_end ? ahead : to_end;
+}
+
+int32_t sys_ringbuffer_peek_held(sys_ringbuffer* rb, uint8_t* dst, uint32_t len) {
+    // pkt_cnt is stored (release) after the producer wrote the bytes it
+    // counts, and the acquire load in ahead() makes them visible here.
+    if (len == 0 || sys_ringbuffer_ahead(rb) < len) return 0;
+    if (dst) sys_ringbuffer_read_peek(rb, dst, len, rb->unreleased);
+    return static_cast<int32_t>(len);
+}
+
+int32_t sys_ringbuffer_take_held(sys_ringbuffer* rb, uint8_t* dst, uint32_t len) {
+    if (sys_ringbuffer_peek_held(rb, dst, len) == 0) return 0;
+    rb->unreleased += len;
+    // Never wait for the lock here: the streaming thread holds it while it
+    // reads a block, and the next take tries again.
+    if (rb->unreleased >= release_batch(rb) && pthread_mutex_trylock(&rb->ring_mutex) == 0) {
+        sys_ringbuffer_settle_locked(rb);
+        pthread_mutex_unlock(&rb->ring_mutex);
+    }
+    return static_cast<int32_t>(len);
+}
+
+namespace {
+
 // Consumer side of byte_read_peek, with the lock held: waits until `len`
 // bytes are held, end of stream, or the timed wait expires.
 uint32_t wait_and_copy_locked(sys_ringbuffer* rb, uint8_t* dst, int32_t len) {
+    sys_ringbuffer_settle_locked(rb);
     rb->rsize_req = len;
     rb->srlock = 1;
     int32_t avail = sys_ringbuffer_avail_internal(rb);
@@ -204,20 +286,6 @@ uint32_t wait_and_copy_locked(sys_ringbuffer* rb, uint8_t* dst, int32_t len) {
     if (dst && count) sys_ringbuffer_read_peek(rb, dst, count, 0);
     rb->rsize_req = 0;
     return count;
-}
-
-void release_locked(sys_ringbuffer* rb, uint32_t len) {
-    uint32_t p = rb->pread + len;
-    if (p >= rb->size) p -= rb->size;
-    rb->pread = p;
-    store_cnt(rb, load_cnt(rb) - len);
-    // Released bytes stay readable until the producer needs their room.
-    rb->hist += len;
-    trim_history(rb);
-    rb->taken = rb->taken > UINT32_MAX - len ? UINT32_MAX : rb->taken + len;
-    if (rb->wsize_req != 0 && sys_ringbuffer_free_internal(rb) >= rb->wsize_req)
-        pthread_cond_signal(&rb->ring_free_cond);
-    rb->srlock = 0;
 }
 
 }  // namespace
@@ -240,6 +308,7 @@ int32_t sys_ringbuffer_byte_read(sys_ringbuffer* rb, uint8_t* dst, int32_t len) 
 
 void sys_ringbuffer_byte_release(sys_ringbuffer* rb, uint32_t len) {
     pthread_mutex_lock(&rb->ring_mutex);
+    sys_ringbuffer_settle_locked(rb);
     release_locked(rb, len);
     pthread_mutex_unlock(&rb->ring_mutex);
 }
@@ -311,6 +380,7 @@ void sys_ringbuffer_commit_locked(sys_ringbuffer* rb, uint32_t len) {
 
 int sys_ringbuffer_rewind(sys_ringbuffer* rb, uint32_t len) {
     pthread_mutex_lock(&rb->ring_mutex);
+    sys_ringbuffer_settle_locked(rb);
     const bool held = len <= rb->hist;
     if (held) {
         rb->pread = rb->pread >= len ? rb->pread - len : rb->pread + rb->size - len;
@@ -323,6 +393,7 @@ int sys_ringbuffer_rewind(sys_ringbuffer* rb, uint32_t len) {
 
 uint32_t sys_ringbuffer_history(sys_ringbuffer* rb) {
     pthread_mutex_lock(&rb->ring_mutex);
+    sys_ringbuffer_settle_locked(rb);
     const uint32_t h = rb->hist;
     pthread_mutex_unlock(&rb->ring_mutex);
     return h;

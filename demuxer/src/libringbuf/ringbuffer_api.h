@@ -35,6 +35,8 @@ struct sys_ringbuffer {
                                 the streaming thread reads ahead in step with it */
     int8_t retry_read;       /* the streaming thread's next read follows a wait
                                 at the end of the input */
+    uint32_t unreleased;     /* consumer only: bytes taken past pread without
+                                the lock, released later in a batch */
     rb_mutex_t ring_mutex;
     rb_cond_t ring_avail_cond;
     rb_cond_t ring_free_cond;
@@ -73,6 +75,25 @@ int32_t sys_ringbuffer_byte_write2(sys_ringbuffer* rb, uint32_t len);
 int sys_ringbuffer_rewind(sys_ringbuffer* rb, uint32_t len);
 /* Released bytes that can still be taken back. */
 uint32_t sys_ringbuffer_history(sys_ringbuffer* rb);
+
+/* Consumer fast path, without the lock. The bytes from pread to pread +
+ * pkt_cnt are the consumer's until it releases them, so it may copy them
+ * while the producer writes elsewhere. take_held copies `len` bytes (dst may
+ * be null) when that many are held past what it took before, counts them as
+ * taken and releases the taken bytes in a batch when the lock is free; it
+ * returns 0 (nothing changes) when fewer are held. peek_held copies without
+ * taking. settle releases what was taken. Every locked consumer operation
+ * settles first; resets, flush and close drop what was taken. */
+int32_t sys_ringbuffer_take_held(sys_ringbuffer* rb, uint8_t* dst, uint32_t len);
+int32_t sys_ringbuffer_peek_held(sys_ringbuffer* rb, uint8_t* dst, uint32_t len);
+void sys_ringbuffer_settle(sys_ringbuffer* rb);
+/* The held bytes past what the consumer took that follow each other in the
+ * storage (up to where it wraps), at *at; consumer only. They stay as they
+ * are until the consumer releases them. */
+uint32_t sys_ringbuffer_held_span(const sys_ringbuffer* rb, const uint8_t** at);
+/* Bytes held past what the consumer took; consumer only. */
+uint32_t sys_ringbuffer_ahead(const sys_ringbuffer* rb);
+void sys_ringbuffer_settle_locked(sys_ringbuffer* rb);
 
 /* Both writes clear rlock and wlock: the producer's block is then stored or
  * dropped, no longer in flight. */

@@ -30,6 +30,12 @@ bool rewind_ring(cb_buffer_st* cb, cb_off_t target) {
     return true;
 }
 
+uint32_t cb_ring_span(cb_buffer_st* cb, const uint8_t** at) {
+    sys_ringbuffer* rb = cb->active_rbuf;
+    if (!rb || cb->buffer_type != CB_STREAM_RBUF || side_active(cb) || rb_paused(rb)) return 0;
+    return sys_ringbuffer_held_span(rb, at);
+}
+
 void init_multi_thread_plugin(cb_buffer_st* cb) {
     cb->cb_read = cb_read_multi;
     cb->cb_peek = cb_peek_multi;
@@ -64,6 +70,13 @@ int32_t cb_read_multi(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
         if (!more) return n;
         return n + cb_read_multi(cb, dst ? dst + n : nullptr, size - n);
     }
+    // Held already: no lock and no hand-over (the release comes later, in a
+    // batch, and before any wait).
+    if (!rb_paused(rb) && sys_ringbuffer_take_held(rb, dst, static_cast<uint32_t>(size)) == size) {
+        cb->curpos += static_cast<cb_fpos>(size);
+        cb->cb_errcode = CB_ERR_OK;
+        return size;
+    }
     // Requests beyond the ring's capacity are served in pieces that fit.
     const int32_t cap = ring_capacity(cb);
     int32_t total = 0;
@@ -94,6 +107,10 @@ int32_t cb_peek_multi(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
     }
     // A peek can show at most what the ring can hold.
     if (size > ring_capacity(cb)) size = ring_capacity(cb);
+    if (!rb_paused(rb) && sys_ringbuffer_peek_held(rb, dst, static_cast<uint32_t>(size)) == size) {
+        cb->cb_errcode = CB_ERR_OK;
+        return size;
+    }
     const int32_t n = sys_ringbuffer_byte_read_peek(rb, dst, size);
     cb->cb_errcode = n < size ? short_outcome(rb) : CB_ERR_OK;
     pthread_mutex_lock(&rb->ring_mutex);

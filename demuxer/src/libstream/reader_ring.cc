@@ -11,10 +11,11 @@ void wait_while_paused(sys_ringbuffer* rb) {
 
 void WriteData(cb_buffer_st* cb, uint32_t wanted) {
     sys_ringbuffer* rb = cb->active_rbuf;
-    if (rb_held(rb) >= wanted || rb_eos(rb)) return;
+    if (sys_ringbuffer_ahead(rb) >= wanted || rb_eos(rb)) return;
     // Straight from the input into the ring's free space, a block (or what
     // is left before the storage wraps) at a time.
     pthread_mutex_lock(&rb->ring_mutex);
+    sys_ringbuffer_settle_locked(rb);
     for (;;) {
         const int block = cb->input->block_size;
         if (block <= 0 || sys_ringbuffer_free_internal(rb) < block) break;
@@ -41,6 +42,13 @@ int32_t read_rbuf_data(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
         if (!more) return n;
         return n + read_rbuf_data(cb, dst ? dst + n : nullptr, size - n);
     }
+    // Held already: no lock (the release comes later, in a batch).
+    if (!rb_paused(rb) && sys_ringbuffer_take_held(rb, dst, static_cast<uint32_t>(size)) == size) {
+        cb->curpos += static_cast<cb_fpos>(size);
+        cb->cb_errcode = CB_ERR_OK;
+        return size;
+    }
+    sys_ringbuffer_settle(rb);
     int32_t total = 0;
     while (total < size) {
         rb->srlock = 1;
@@ -80,6 +88,11 @@ int32_t peek_rbuf_data(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
         const int32_t n = side_peek(cb, dst, size, &use_ring);
         if (!use_ring) return n;
     }
+    if (!rb_paused(rb) && sys_ringbuffer_peek_held(rb, dst, static_cast<uint32_t>(size)) == size) {
+        cb->cb_errcode = CB_ERR_OK;
+        return size;
+    }
+    sys_ringbuffer_settle(rb);
     rb->srlock = 1;
     WriteData(cb, static_cast<uint32_t>(size));
     const int32_t count = sys_ringbuffer_byte_read_peek_single_thread(rb, dst, size);

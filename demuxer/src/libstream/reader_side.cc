@@ -26,6 +26,8 @@ cb_off_t fetch_side(cb_buffer_st* cb, cb_fpos target) {
     cb_io_st* in = cb->input;
     const cb_fpos ring_pos = s->active ? s->ring_pos : cb->curpos;
     pthread_mutex_lock(&rb->ring_mutex);
+    // The way back below is the end of what the ring holds.
+    sys_ringbuffer_settle_locked(rb);
     if (in->seek(in, static_cast<cb_off_t>(target), CB_SEEK_SET) == -1) {
         pthread_mutex_unlock(&rb->ring_mutex);
         return -1;
@@ -127,6 +129,15 @@ cb_off_t ring_seek_to(cb_buffer_st* cb, cb_off_t target) {
         cb->curpos = t;
         return target;
     }
+    // A short skip over held bytes (padding, a header parsed from a peek):
+    // taken without the lock, like a read.
+    if (!s->active && t >= cb->curpos && !rb_paused(rb) &&
+        t - cb->curpos <= sys_ringbuffer_ahead(rb)) {
+        (void)sys_ringbuffer_take_held(rb, nullptr, static_cast<uint32_t>(t - cb->curpos));
+        cb->curpos = t;
+        return target;
+    }
+    sys_ringbuffer_settle(rb);
     const cb_fpos rp = s->active ? s->ring_pos : cb->curpos;
     const uint64_t held = rb_held(rb);
     const int block = cb->input->block_size;

@@ -76,6 +76,7 @@ int seek_out_of_buffer(cb_buffer_st* cb, cb_off_t offset, int whence) {
             if (!cb->active_rbuf) return 1;
             if (whence != CB_SEEK_SET && whence != CB_SEEK_CUR) return 1;
             // From the oldest byte the history keeps to the end of what is held.
+            sys_ringbuffer_settle(cb->active_rbuf);
             const cb_off_t held = rb_held(cb->active_rbuf);
             const cb_off_t kept = sys_ringbuffer_history(cb->active_rbuf);
             const cb_off_t delta = whence == CB_SEEK_SET ? offset - cur : offset;

@@ -32,6 +32,11 @@ int cb_tell(const cb_buffer_st* cbuf);      /* curpos truncated to 32 bits */
 int cb_status(const cb_buffer_st* cbuf);    /* CB_ErrCode of the last read or peek */
 /* Size of the input; leaves the reader at position 0 unless the input is streaming. */
 cb_fpos cb_get_file_size(cb_buffer_st* cbuf);
+/* Bytes at the read position that a ring already holds, one after the other
+ * in memory, at *at (0 when there are none, or no ring serves the reads):
+ * a parser may read them in place, then move on with cb_seek64 from the
+ * current position. Valid until the next call on the reader. */
+uint32_t cb_ring_span(cb_buffer_st* cbuf, const uint8_t** at);
 /* Non-zero installs the multi-thread set, zero the single-thread set. */
 void changeThreadType(cb_buffer_st* cbuf, int useRingBuf);
 
