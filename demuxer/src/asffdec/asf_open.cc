@@ -178,8 +178,10 @@ extern "C" int asf_init_demuxer(void** ctx, cb_io_st* cbio, void* buffer, int bu
                               static_cast<uint32_t>(d->s.duration / 1000));
 
     // Step over the packets to what follows the data object. A size below
-    // its own header would be a backward seek: the index is then unreachable.
-    if (data_size >= asf::data_object::kSize &&
+    // its own header would be a backward seek, and a size of just its header
+    // (a recorded live stream) would read the packets as objects: the index
+    // is then unreachable.
+    if (data_size > asf::data_object::kSize &&
         asf::skip(d, data_size - asf::data_object::kSize))
         asf_parse_index(d);
 
