@@ -128,34 +128,32 @@ TEST(AacChannels, AdtsTakesTheFirstHeaderWithAValidRate) {
 TEST(AacChannels, LatmReadsTheFirstUsableStreamMuxConfigAndNeverOverreads) {
     using tkb::LoasConfig;
     using tkb::LoasLayer;
-    auto config = [](int version, std::vector<std::vector<LoasLayer>> programs) {
-        LoasConfig c;
-        c.mux_version = version;
-        c.programs = std::move(programs);
-        return c;
-    };
+    LoasConfig v0;
+    LoasConfig v1;
+    v1.mux_version = 1;
+    v1.programs = {{LoasLayer{false, {2, 3, 6}, 16}}};
     LoasConfig same_mux;
     same_mux.use_same_stream_mux = true;
-    const LoasConfig v1 = config(1, {{LoasLayer{false, {2, 3, 6}, 16}}});
+    LoasConfig second_layer;
+    second_layer.mux_version = 1;
+    second_layer.programs = {{LoasLayer{false, {3, 4, 2}, 19}, LoasLayer{false, {2, 4, 1}, 0}}};
+    LoasConfig shared_layer;
+    shared_layer.programs = {{LoasLayer{false, {2, 4, 0}, 0}, LoasLayer{true, {}, 0},
+                              LoasLayer{false, {5, 6, 7}, 0}}};
+    LoasConfig second_program;
+    second_program.programs = {{LoasLayer{false, {3, 4, 2}, 0}}, {LoasLayer{false, {2, 4, 2}, 0}}};
+    LoasConfig none_usable;
+    none_usable.programs = {{LoasLayer{false, {3, 4, 2}, 0}}};
     const ChannelCase cases[] = {
-        {"version 0", tkb::loas_frame(LoasConfig{}), 1, 2},
+        {"version 0", tkb::loas_frame(v0), 1, 2},
         {"version 1 with config length", tkb::loas_frame(v1), 1, 6},
-        {"behind junk and a lone sync byte",
-         tkb::cat({Bytes{0x56, 0x00, 0x12}, tkb::loas_frame(LoasConfig{})}), 1, 2},
-        {"same stream mux, then a config",
-         tkb::cat({tkb::loas_frame(same_mux), tkb::loas_frame(v1)}), 1, 6},
+        {"behind junk and a lone sync byte", tkb::cat({Bytes{0x56, 0x00, 0x12}, tkb::loas_frame(v0)}), 1, 2},
+        {"same stream mux, then a config", tkb::cat({tkb::loas_frame(same_mux), tkb::loas_frame(v1)}), 1, 6},
         {"only same stream mux", tkb::loas_frame(same_mux), -1, -1},
-        {"second layer after an unusable one",
-         tkb::loas_frame(config(1, {{LoasLayer{false, {3, 4, 2}, 19}, LoasLayer{false, {2, 4, 1}, 0}}})),
-         1, 1},
-        {"layer sharing the config is skipped",
-         tkb::loas_frame(config(0, {{LoasLayer{false, {2, 4, 0}, 0}, LoasLayer{true, {}, 0},
-                                     LoasLayer{false, {5, 6, 7}, 0}}})),
-         1, 8},
-        {"second program",
-         tkb::loas_frame(config(0, {{LoasLayer{false, {3, 4, 2}, 0}}, {LoasLayer{false, {2, 4, 2}, 0}}})),
-         1, 2},
-        {"no usable config", tkb::loas_frame(config(0, {{LoasLayer{false, {3, 4, 2}, 0}}})), -1, -1},
+        {"second layer after an unusable one", tkb::loas_frame(second_layer), 1, 1},
+        {"layer sharing the config is skipped", tkb::loas_frame(shared_layer), 1, 8},
+        {"second program", tkb::loas_frame(second_program), 1, 2},
+        {"no usable config", tkb::loas_frame(none_usable), -1, -1},
         {"sync word only", {0x56, 0xE0}, -1, -1},
         {"sync in the last byte", {0x00, 0x56}, -1, -1},
         {"empty", {}, -1, -1},
