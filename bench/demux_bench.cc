@@ -199,33 +199,11 @@ Result copy(const Bytes& file, Bytes& dst) {
 
 // ---- inputs ----
 
-std::string self_dir() {
-    char buf[PATH_MAX];
-    const ssize_t n = readlink("/proc/self/exe", buf, sizeof buf - 1);
-    if (n <= 0) return ".";
-    std::string p(buf, static_cast<size_t>(n));
-    return p.substr(0, p.find_last_of('/'));
-}
-
 bool read_file(const std::string& path, Bytes* out) {
     std::ifstream f(path, std::ios::binary);
     if (!f) return false;
     out->assign(std::istreambuf_iterator<char>(f), {});
     return true;
-}
-
-std::vector<std::string> corpus_files(const std::string& dir) {
-    std::vector<std::string> out;
-    if (DIR* d = opendir(dir.c_str())) {
-        while (dirent* e = readdir(d)) {
-            const std::string n = e->d_name;
-            if (n.size() > 4 && (n.ends_with(".wmv") || n.ends_with(".wma") || n.ends_with(".asf")))
-                out.push_back(dir + "/" + n);
-        }
-        closedir(d);
-    }
-    std::sort(out.begin(), out.end());
-    return out;
 }
 
 std::string base_name(const std::string& p) { return p.substr(p.find_last_of('/') + 1); }
@@ -313,8 +291,7 @@ void print_summary() {
 }  // namespace
 
 int main(int argc, char** argv) {
-    std::string corpus, cache = plimo_bench::default_cache_dir(), big;
-    if (const char* c = std::getenv("ASF_CORPUS")) corpus = c;
+    std::string corpus = plimo_bench::default_corpus_dir(), cache = plimo_bench::default_cache_dir(), big;
     for (int i = 1; i + 1 < argc; i += 2) {
         const std::string a = argv[i];
         if (a == "--corpus") corpus = argv[i + 1];
@@ -329,9 +306,8 @@ int main(int argc, char** argv) {
             return 2;
         }
     }
-    if (corpus.empty()) corpus = self_dir() + "/../../../shared/corpus";
     setenv("PLIMO_LOG", "off", 1);
-    for (const std::string& f : corpus_files(corpus)) {
+    for (const std::string& f : plimo_bench::corpus_files(corpus)) {
         struct stat st;
         stat(f.c_str(), &st);
         report(f, static_cast<size_t>(st.st_size));

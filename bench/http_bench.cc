@@ -241,35 +241,10 @@ struct FileRuns {
     std::vector<std::tuple<std::string, Run, Run>> seek;                  // (who, warm-up only, all)
 };
 
-std::vector<std::string> corpus_files(const std::string& dir) {
-    std::vector<std::string> out;
-    if (DIR* d = opendir(dir.c_str())) {
-        while (dirent* e = readdir(d)) {
-            const std::string n = e->d_name;
-            const auto ends = [&](const char* s) {
-                const size_t k = std::strlen(s);
-                return n.size() > k && n.compare(n.size() - k, k, s) == 0;
-            };
-            if (ends(".asf") || ends(".wmv") || ends(".wma")) out.push_back(dir + "/" + n);
-        }
-        closedir(d);
-    }
-    std::sort(out.begin(), out.end());
-    return out;
-}
-
 }  // namespace
 
 int main(int argc, char** argv) {
-    std::string corpus;
-    if (const char* c = std::getenv("ASF_CORPUS")) corpus = c;
-    if (corpus.empty()) {
-        char self[4096];
-        const ssize_t n = readlink("/proc/self/exe", self, sizeof self - 1);
-        std::string dir = n > 0 ? std::string(self, static_cast<size_t>(n)) : std::string(".");
-        dir = dir.substr(0, dir.find_last_of('/'));
-        corpus = dir + "/../../../shared/corpus";
-    }
+    std::string corpus = plimo_bench::default_corpus_dir();
     std::string cache = plimo_bench::default_cache_dir(), big, only;
     int seeks = 20;
     for (int i = 1; i < argc; ++i) {
@@ -295,7 +270,7 @@ int main(int argc, char** argv) {
     char tmpl[] = "/tmp/plimo_http_bench_XXXXXX";
     if (!mkdtemp(tmpl)) return 1;
     const std::string root = tmpl;
-    std::vector<std::string> files = corpus_files(corpus);
+    std::vector<std::string> files = plimo_bench::corpus_files(corpus);
     if (!big.empty()) files.insert(files.begin(), big);
     std::vector<FileRuns> all;
     for (const std::string& path : files) {

@@ -313,35 +313,10 @@ void print_summary() {
     }
 }
 
-std::vector<std::string> corpus_files(const std::string& dir) {
-    std::vector<std::string> out;
-    if (DIR* d = opendir(dir.c_str())) {
-        while (dirent* e = readdir(d)) {
-            const std::string n = e->d_name;
-            if (n[0] == '.' || n.size() < 5 || n.find(".json") != std::string::npos || n.find(".md") != std::string::npos)
-                continue;
-            out.push_back(dir + "/" + n);
-        }
-        closedir(d);
-    }
-    std::sort(out.begin(), out.end());
-    return out;
-}
-
 }  // namespace
 
 int main(int argc, char** argv) {
-    // The corpus beside the checkout (BUILD/bench/ -> ../../../shared/corpus)
-    // unless told otherwise.
-    std::string corpus;
-    if (const char* c = std::getenv("ASF_CORPUS")) corpus = c;
-    if (corpus.empty()) {
-        char self[4096];
-        const ssize_t n = readlink("/proc/self/exe", self, sizeof self - 1);
-        std::string dir = n > 0 ? std::string(self, static_cast<size_t>(n)) : std::string(".");
-        dir = dir.substr(0, dir.find_last_of('/'));
-        corpus = dir + "/../../../shared/corpus";
-    }
+    std::string corpus = plimo_bench::default_corpus_dir();
     std::string cache = plimo_bench::default_cache_dir(), big;
     int count = 200;
     for (int i = 1; i < argc; ++i) {
@@ -366,7 +341,7 @@ int main(int argc, char** argv) {
     Bytes file;
     if (!big.empty() && read_file(big, &file)) run_file("big.wmv", file, count);
     else std::fprintf(stderr, "no large file (ffmpeg missing?); skipped\n");
-    for (const std::string& path : corpus_files(corpus))
+    for (const std::string& path : plimo_bench::corpus_files(corpus))
         if (read_file(path, &file)) run_file(path.substr(path.find_last_of('/') + 1), file, count);
     print_summary();
     return 0;

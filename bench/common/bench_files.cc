@@ -1,8 +1,11 @@
 #include "bench_files.h"
 
+#include <dirent.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <cstdio>
+#include <algorithm>
 #include <cstdlib>
 
 namespace plimo_bench {
@@ -27,6 +30,28 @@ std::string big_file(const std::string& cache) {
     std::fprintf(stderr, "making %s with ffmpeg...\n", path.c_str());
     if (std::system(cmd.c_str()) != 0) return "";
     return path;
+}
+
+std::string default_corpus_dir() {
+    if (const char* c = std::getenv("ASF_CORPUS")) return c;
+    char self[4096];
+    const ssize_t n = readlink("/proc/self/exe", self, sizeof self - 1);
+    const std::string exe = n > 0 ? std::string(self, static_cast<size_t>(n)) : std::string("./x");
+    return exe.substr(0, exe.find_last_of('/')) + "/../../../shared/corpus";
+}
+
+std::vector<std::string> corpus_files(const std::string& dir) {
+    std::vector<std::string> out;
+    if (DIR* d = opendir(dir.c_str())) {
+        while (dirent* e = readdir(d)) {
+            const std::string n = e->d_name;
+            if (n.size() > 4 && (n.ends_with(".wmv") || n.ends_with(".wma") || n.ends_with(".asf")))
+                out.push_back(dir + "/" + n);
+        }
+        closedir(d);
+    }
+    std::sort(out.begin(), out.end());
+    return out;
 }
 
 }  // namespace plimo_bench

@@ -3,6 +3,7 @@
 #pragma once
 
 #include <string>
+#include <vector>
 
 namespace plimo_bench {
 
@@ -13,5 +14,12 @@ std::string default_cache_dir();
 // 2 s and WMA2 audio, made with ffmpeg the first time; "" when it cannot be
 // made (ffmpeg missing).
 std::string big_file(const std::string& cache);
+
+// $ASF_CORPUS, else the corpus beside the checkout (BUILD/bench/ ->
+// ../../../shared/corpus).
+std::string default_corpus_dir();
+
+// The .asf, .wmv and .wma files of `dir`, sorted.
+std::vector<std::string> corpus_files(const std::string& dir);
 
 }  // namespace plimo_bench
