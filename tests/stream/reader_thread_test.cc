@@ -114,6 +114,10 @@ TEST(ReaderSyncRing, ReadsPeeksAndSeeksOnTheCallersThread) {
     ASSERT_EQ(r.open(Mode::SyncRing), 0);
     EXPECT_EQ(r.read_vec(100), r.slice(0, 100));
     EXPECT_EQ(r.in_->counters().reads, 1u) << "one block topped up";
+    // Measuring the input keeps what the ring holds: nothing is read twice.
+    EXPECT_EQ(cb_get_file_size(&r.cb_), 5000u);
+    EXPECT_EQ(r.read_vec(100), r.slice(0, 100));
+    EXPECT_EQ(r.in_->counters().reads, 1u);
     uint8_t p[600];
     EXPECT_EQ(r.peek(p, 600), 600);
     EXPECT_EQ(std::vector<uint8_t>(p, p + 600), r.slice(100, 600));

@@ -20,7 +20,7 @@ void reset_ring_at_input(cb_buffer_st* cb, bool move, int time_ms) {
     cb->curpos = static_cast<cb_fpos>(in->tell(in));
     sys_ringbuffer_reset_locked(rb);
     pthread_mutex_unlock(&rb->ring_mutex);
-    if (cb->base) ring_side(cb)->active = ring_side(cb)->valid = 0;
+    if (cb->base) ring_side(cb)->active = ring_side(cb)->valid = ring_side(cb)->input_away = 0;
 }
 
 void reset_reader_at_input(cb_buffer_st* cb, bool move, int time_ms) {

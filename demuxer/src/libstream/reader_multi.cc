@@ -55,7 +55,7 @@ cb_off_t reposition_ring_input(cb_buffer_st* cb, cb_off_t target, int whence) {
     if (r != -1) sys_ringbuffer_reset_locked(rb);
     pthread_mutex_unlock(&rb->ring_mutex);
     // A visit outside the ring ends with any move of the ring.
-    if (r != -1 && cb->base) ring_side(cb)->active = 0;
+    if (r != -1 && cb->base) ring_side(cb)->active = ring_side(cb)->input_away = 0;
     return r;
 }
 

@@ -16,6 +16,16 @@ void WriteData(cb_buffer_st* cb, uint32_t wanted) {
     // is left before the storage wraps) at a time.
     pthread_mutex_lock(&rb->ring_mutex);
     sys_ringbuffer_settle_locked(rb);
+    ring_side_st* s = cb->base ? ring_side(cb) : nullptr;
+    if (s && s->input_away) {
+        // Left at the end by a seek from there: back to where the ring's bytes end.
+        if (cb->input->seek(cb->input, static_cast<cb_off_t>(s->input_back), CB_SEEK_SET) == -1) {
+            rb_set_eos(rb, 1);
+            pthread_mutex_unlock(&rb->ring_mutex);
+            return;
+        }
+        s->input_away = 0;
+    }
     for (;;) {
         const int block = cb->input->block_size;
         if (block <= 0 || sys_ringbuffer_free_internal(rb) < block) break;

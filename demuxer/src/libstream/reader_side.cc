@@ -35,6 +35,7 @@ cb_off_t fetch_side(cb_buffer_st* cb, cb_fpos target) {
     const int block = in->block_size;
     const size_t n = block > 0 ? in->read(in, side_memory(cb), static_cast<size_t>(block)) : 0;
     cb_fpos back = ring_pos + rb_held(rb);
+    s->input_away = 0;
     if (in->seek(in, static_cast<cb_off_t>(back), CB_SEEK_SET) == -1) {
         // The input stays behind the side block: the ring starts there.
         back = target + n;
@@ -68,6 +69,31 @@ bool leave_side_at_end(cb_buffer_st* cb) {
 
 }  // namespace
 
+cb_off_t ring_seek_end(cb_buffer_st* cb, cb_off_t offset) {
+    ring_side_st* s = ring_side(cb);
+    sys_ringbuffer* rb = cb->active_rbuf;
+    cb_io_st* in = cb->input;
+    const cb_fpos ring_pos = s->active ? s->ring_pos : cb->curpos;
+    pthread_mutex_lock(&rb->ring_mutex);
+    sys_ringbuffer_settle_locked(rb);
+    const cb_off_t r = in->seek(in, offset, CB_SEEK_END);
+    if (r != -1 && !s->input_away) {
+        // The input stays there until the ring reads again (WriteData).
+        s->input_away = 1;
+        s->input_back = ring_pos + rb_held(rb);
+    }
+    pthread_mutex_unlock(&rb->ring_mutex);
+    if (r == -1) return -1;
+    // An empty visit: a read there moves the ring, a seek back finds it.
+    s->ring_pos = ring_pos;
+    s->active = 1;
+    s->valid = 0;
+    s->side_pos = static_cast<cb_fpos>(r);
+    s->side_len = 0;
+    cb->curpos = static_cast<cb_fpos>(r);
+    return r;
+}
+
 ring_side_st* ring_side(const cb_buffer_st* cb) { return reinterpret_cast<ring_side_st*>(cb->base); }
 
 bool side_active(const cb_buffer_st* cb) { return cb->base && cb->active_rbuf && ring_side(cb)->active; }
@@ -93,8 +119,9 @@ int32_t side_peek(cb_buffer_st* cb, uint8_t* dst, int32_t size, bool* use_ring) 
     *use_ring = false;
     const int block = cb->input->block_size;
     // A side block shorter than a block ends at the end of the input: a peek
-    // beyond it is short whatever reads it.
-    const bool at_end = block > 0 && s->side_len < static_cast<uint32_t>(block);
+    // beyond it is short whatever reads it. (The empty visit of a seek from
+    // the end has read nothing: it says nothing about the end.)
+    const bool at_end = s->valid && block > 0 && s->side_len < static_cast<uint32_t>(block);
     if (cb->curpos + static_cast<uint32_t>(size) > side_end(s) && !at_end) {
         if (size > block) {
             // Larger than a side block: from the ring.

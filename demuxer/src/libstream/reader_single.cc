@@ -97,7 +97,7 @@ void seek_reset_buffer(cb_buffer_st* cb, cb_off_t pos) {
     cb->curpos = static_cast<cb_fpos>(pos);
     if (cb->active_rbuf) {
         sys_ringbuffer_reset(cb->active_rbuf);
-        if (cb->base) ring_side(cb)->active = 0;
+        if (cb->base) ring_side(cb)->active = ring_side(cb)->input_away = 0;
     }
     else if (cb->fs_cache.buffer)
         cache_input_moved(cb, static_cast<cb_fpos>(pos));  // the slots' bytes stay valid
@@ -106,10 +106,13 @@ void seek_reset_buffer(cb_buffer_st* cb, cb_off_t pos) {
 cb_off_t cb_seek_single64(cb_buffer_st* cb, cb_off_t offset, int whence) {
     cb_io_st* in = cb->input;
     cb_off_t r = 0;
-    if (cb->buffer_type == CB_STREAM_RBUF && cb->active_rbuf && cb->base &&
-        (whence == CB_SEEK_SET || whence == CB_SEEK_CUR)) {
-        const cb_off_t target = whence == CB_SEEK_SET ? offset : static_cast<cb_off_t>(cb->curpos) + offset;
-        return ring_seek_to(cb, target);
+    if (cb->buffer_type == CB_STREAM_RBUF && cb->active_rbuf && cb->base) {
+        if (whence == CB_SEEK_END) return ring_seek_end(cb, offset);
+        if (whence == CB_SEEK_SET || whence == CB_SEEK_CUR) {
+            const cb_off_t target =
+                whence == CB_SEEK_SET ? offset : static_cast<cb_off_t>(cb->curpos) + offset;
+            return ring_seek_to(cb, target);
+        }
     }
     switch (whence) {
         case CB_SEEK_SET:

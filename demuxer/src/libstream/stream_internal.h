@@ -89,6 +89,11 @@ struct ring_side_st {
     uint32_t side_len;  // bytes in the side block
     cb_fpos side_pos;   // input position of its first byte
     cb_fpos ring_pos;   // the ring's read position while the visit lasts
+    // A seek from the end left the input there; the synchronous ring's next
+    // read moves it back to input_back (where the ring's bytes end) first.
+    // Whatever else moves the input or empties the ring clears it.
+    int input_away;
+    cb_fpos input_back;
 };
 ring_side_st* ring_side(const cb_buffer_st* cb);
 bool side_active(const cb_buffer_st* cb);
@@ -101,6 +106,11 @@ int32_t side_peek(cb_buffer_st* cb, uint8_t* dst, int32_t size, bool* use_ring);
 // Seek of a ring-buffered reader, either set: inside the ring, its history,
 // the side block, or a visit elsewhere. The new position or -1.
 cb_off_t ring_seek_to(cb_buffer_st* cb, cb_off_t target);
+// Seek from the end (a caller measuring the input) of the synchronous ring:
+// the ring keeps its bytes for the seek back that follows, and the input is
+// put back only when the ring reads again. The new position or -1 (nothing
+// changed).
+cb_off_t ring_seek_end(cb_buffer_st* cb, cb_off_t offset);
 
 // Starts / stops the streaming thread.
 int OpenStream(cb_buffer_st* cb, const hova_callback_st* cbs);
