@@ -19,6 +19,7 @@ void reset_ring_at_input(cb_buffer_st* cb, bool move, int time_ms) {
     if (move && in->seek_time) (void)in->seek_time(in, time_ms);
     cb->curpos = static_cast<cb_fpos>(in->tell(in));
     sys_ringbuffer_reset_locked(rb);
+    if (cb->base) end_hold_locked(cb);
     pthread_mutex_unlock(&rb->ring_mutex);
     if (cb->base) ring_side(cb)->active = ring_side(cb)->valid = ring_side(cb)->input_away = 0;
 }

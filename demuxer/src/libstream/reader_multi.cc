@@ -52,7 +52,10 @@ cb_off_t reposition_ring_input(cb_buffer_st* cb, cb_off_t target, int whence) {
     // here) or wholly after it.
     pthread_mutex_lock(&rb->ring_mutex);
     const cb_off_t r = in->seek(in, target, whence);
-    if (r != -1) sys_ringbuffer_reset_locked(rb);
+    if (r != -1) {
+        sys_ringbuffer_reset_locked(rb);
+        if (cb->base) end_hold_locked(cb);
+    }
     pthread_mutex_unlock(&rb->ring_mutex);
     // A visit outside the ring ends with any move of the ring.
     if (r != -1 && cb->base) ring_side(cb)->active = ring_side(cb)->input_away = 0;

@@ -43,6 +43,11 @@ cb_off_t fetch_side(cb_buffer_st* cb, cb_fpos target) {
         s->ring_pos = back;
     } else {
         s->ring_pos = ring_pos;
+        // The input's transfer is here now: ring bytes read ahead at the old
+        // place would cost a request of their own, and the seek that made
+        // this visit often lands here (and reads on from the block's end) or
+        // elsewhere, dropping them.
+        s->hold_ahead = 1;
     }
     pthread_mutex_unlock(&rb->ring_mutex);
     s->active = 1;
@@ -63,6 +68,7 @@ bool leave_side_at_end(cb_buffer_st* cb) {
         if (r == -1) return false;
     }
     s->active = 0;
+    end_hold(cb);
     cb->curpos = end;
     return true;
 }
@@ -92,6 +98,21 @@ cb_off_t ring_seek_end(cb_buffer_st* cb, cb_off_t offset) {
     s->side_len = 0;
     cb->curpos = static_cast<cb_fpos>(r);
     return r;
+}
+
+void end_hold_locked(cb_buffer_st* cb) {
+    ring_side_st* s = ring_side(cb);
+    if (!s->hold_ahead) return;
+    s->hold_ahead = 0;
+    pthread_cond_signal(&cb->active_rbuf->ring_free_cond);
+}
+
+void end_hold(cb_buffer_st* cb) {
+    // Only the consumer sets the mark, so an unset one needs no lock.
+    if (!ring_side(cb)->hold_ahead) return;
+    pthread_mutex_lock(&cb->active_rbuf->ring_mutex);
+    end_hold_locked(cb);
+    pthread_mutex_unlock(&cb->active_rbuf->ring_mutex);
 }
 
 ring_side_st* ring_side(const cb_buffer_st* cb) { return reinterpret_cast<ring_side_st*>(cb->base); }
@@ -176,6 +197,7 @@ cb_off_t ring_seek_to(cb_buffer_st* cb, cb_off_t target) {
     if (near < (rb->size - 1) / 2) near = (rb->size - 1) / 2;
     if (t >= rp && t - rp <= near) {
         s->active = 0;
+        end_hold(cb);
         cb->curpos = rp;
         if (t > rp) (void)cb->cb_read(cb, nullptr, static_cast<int32_t>(t - rp));
         if (cb->curpos == t) return target;
@@ -186,6 +208,7 @@ cb_off_t ring_seek_to(cb_buffer_st* cb, cb_off_t target) {
         cb->curpos = rp;
         if (rewind_ring(cb, target)) {
             s->active = 0;
+            end_hold(cb);
             return target;
         }
         cb->curpos = was;

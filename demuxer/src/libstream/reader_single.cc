@@ -97,7 +97,10 @@ void seek_reset_buffer(cb_buffer_st* cb, cb_off_t pos) {
     cb->curpos = static_cast<cb_fpos>(pos);
     if (cb->active_rbuf) {
         sys_ringbuffer_reset(cb->active_rbuf);
-        if (cb->base) ring_side(cb)->active = ring_side(cb)->input_away = 0;
+        if (cb->base) {
+            ring_side(cb)->active = ring_side(cb)->input_away = 0;
+            end_hold(cb);
+        }
     }
     else if (cb->fs_cache.buffer)
         cache_input_moved(cb, static_cast<cb_fpos>(pos));  // the slots' bytes stay valid

@@ -94,6 +94,10 @@ struct ring_side_st {
     // Whatever else moves the input or empties the ring clears it.
     int input_away;
     cb_fpos input_back;
+    // A visit read its block elsewhere and the consumer has not come back to
+    // the ring since: the streaming thread reads no further ahead meanwhile.
+    // Written under ring_mutex (the thread reads it there).
+    int hold_ahead;
 };
 ring_side_st* ring_side(const cb_buffer_st* cb);
 bool side_active(const cb_buffer_st* cb);
@@ -106,6 +110,9 @@ int32_t side_peek(cb_buffer_st* cb, uint8_t* dst, int32_t size, bool* use_ring);
 // Seek of a ring-buffered reader, either set: inside the ring, its history,
 // the side block, or a visit elsewhere. The new position or -1.
 cb_off_t ring_seek_to(cb_buffer_st* cb, cb_off_t target);
+// The consumer is back in the ring: the streaming thread may read ahead again.
+void end_hold_locked(cb_buffer_st* cb);
+void end_hold(cb_buffer_st* cb);
 // Seek from the end (a caller measuring the input) of the synchronous ring:
 // the ring keeps its bytes for the seek back that follows, and the input is
 // put back only when the ring reads again. The new position or -1 (nothing

@@ -65,7 +65,10 @@ void* StreamingData(void* arg) {
         // A consumer waiting for more than is held gets the ring's whole room.
         const bool starved = rb->rsize_req > 0 && static_cast<uint32_t>(rb->rsize_req) > held;
         const uint32_t limit = read_ahead_limit(rb, block);
-        const bool want_more = starved || held + block <= limit;
+        // Nothing ahead while a visit elsewhere has the input's transfer
+        // (until the consumer comes back to the ring or moves it).
+        const bool held_back = cb->base && ring_side(cb)->hold_ahead;
+        const bool want_more = starved || (!held_back && held + block <= limit);
         if (room < block || !want_more) {
             // Woken when the consumer has released enough (a whole block's
             // room, and read-ahead below its limit), when it waits for data,
