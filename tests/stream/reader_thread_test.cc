@@ -70,6 +70,18 @@ TEST(ReaderThread, SeeksMoveTheInputOnlyOutsideWhatTheRingKeeps) {
         }
         EXPECT_EQ(cb_tell64(&r.cb_), std::min<uint64_t>(c.target + 3000, std::max<uint64_t>(c.target, 100000)));
     }
+    // While a visit is out, the thread reads nothing more at the ring's old
+    // place (over a network that would be a request of its own).
+    Reader r(pattern(100000), options_for(Mode::Thread, 256, 4096));
+    r.in_->faults().read_delay_us = 2000;
+    ASSERT_EQ(r.open(), 0);
+    r.read_vec(3000);
+    r.read_vec(1000);  // held bytes: released when the seek settles, room for the thread
+    ASSERT_EQ(r.seek(70000, CB_SEEK_SET), 70000);
+    const uint64_t reads = r.in_->counters().reads; fprintf(stderr, "TMP reads %lu held %u\n", (unsigned long)reads, r.cb_.srbuf->pkt_cnt);
+    std::this_thread::sleep_for(std::chrono::milliseconds(30));
+    EXPECT_EQ(r.in_->counters().reads, reads);
+    EXPECT_EQ(r.read_vec(3000), r.slice(70000, 3000));
 }
 
 TEST(ReaderThread, RefusedSeekKeepsTheBufferedBytes) {
