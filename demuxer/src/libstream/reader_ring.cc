@@ -5,23 +5,6 @@
 
 #include "stream_internal.h"
 
-namespace {
-
-// How much one top-up reads when `need` more bytes are wanted: what is
-// needed plus half of what the consumer has taken since the ring last moved
-// (a seek), in 4 KiB steps, at most a block. Whole blocks come back once
-// two blocks were taken; a seek soon followed by another reads little that
-// is not used (over a network, the last block of a seek was mostly unused).
-// The streaming thread's read-ahead grows with what is taken the same way.
-uint32_t top_up_size(uint64_t need, uint64_t taken, uint32_t block) {
-    constexpr uint64_t kStep = 4096;
-    uint64_t n = need + taken / 2;
-    n = (n + kStep - 1) / kStep * kStep;
-    return n < block ? static_cast<uint32_t>(n) : block;
-}
-
-}  // namespace
-
 void wait_while_paused(sys_ringbuffer* rb) {
     while (rb_paused(rb)) usleep(1000);
 }
@@ -29,8 +12,8 @@ void wait_while_paused(sys_ringbuffer* rb) {
 void WriteData(cb_buffer_st* cb, uint32_t wanted) {
     sys_ringbuffer* rb = cb->active_rbuf;
     if (sys_ringbuffer_ahead(rb) >= wanted || rb_eos(rb)) return;
-    // Straight from the input into the ring's free space, a block (less just
-    // after a seek; or what is left before the storage wraps) at a time.
+    // Straight from the input into the ring's free space, a block (or what
+    // is left before the storage wraps) at a time.
     pthread_mutex_lock(&rb->ring_mutex);
     sys_ringbuffer_settle_locked(rb);
     ring_side_st* s = cb->base ? ring_side(cb) : nullptr;
@@ -46,11 +29,8 @@ void WriteData(cb_buffer_st* cb, uint32_t wanted) {
     for (;;) {
         const int block = cb->input->block_size;
         if (block <= 0 || sys_ringbuffer_free_internal(rb) < block) break;
-        const uint32_t held = rb_held(rb);
-        const uint32_t piece =
-            top_up_size(wanted > held ? wanted - held : 0, rb->taken, static_cast<uint32_t>(block));
         uint8_t* at = nullptr;
-        const uint32_t room = sys_ringbuffer_wspace_locked(rb, piece, &at);
+        const uint32_t room = sys_ringbuffer_wspace_locked(rb, static_cast<uint32_t>(block), &at);
         const size_t n = cb->input->read(cb->input, at, room);
         if (n == 0) {
             rb_set_eos(rb, 1);
