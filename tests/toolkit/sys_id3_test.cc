@@ -29,6 +29,7 @@ class Id3 : public HostedToolkit {
 protected:
     // Opens the reader over `file`; the input reports its size as known.
     void open(const Bytes& file, const host::InputOptions& opts = {}) {
+        close();
         input = host::RawInput::from_memory(file, opts);
         ASSERT_EQ(OpenURL(&reader, input->io(), opts.ring_size, host.table()), 0);
         opened = true;
@@ -46,6 +47,11 @@ protected:
         HostedToolkit::TearDown();
     }
     const ST_ID3_INFO& info() const { return ctx.id3_info; }
+    hova_program_info_st program() const {
+        hova_program_info_st p{};
+        get_id3_info(&p, &ctx.id3_info);
+        return p;
+    }
 
     std::unique_ptr<host::RawInput> input;
     cb_buffer_st reader{};
@@ -63,20 +69,15 @@ TEST_F(Id3, DecodesTheTextFramesOfEveryVersionAndLaterFramesReplaceEarlierOnes) 
         uint32_t flag;
     };
     const Item items[] = {
-        {"TIT2", "TT2", &ST_ID3_INFO::Title, ID3_TITLE},
-        {"TPE1", "TP1", &ST_ID3_INFO::Artist, ID3_ARTIST},
-        {"TALB", "TAL", &ST_ID3_INFO::Album, ID3_ALBUM},
-        {"TYER", "TYE", &ST_ID3_INFO::Year, ID3_YEAR},
-        {"COMM", "COM", &ST_ID3_INFO::Comment, ID3_COMMENT},
-        {"TCON", "TCO", &ST_ID3_INFO::Genre, ID3_GENRE},
+        {"TIT2", "TT2", &ST_ID3_INFO::Title, ID3_TITLE}, {"TPE1", "TP1", &ST_ID3_INFO::Artist, ID3_ARTIST},
+        {"TALB", "TAL", &ST_ID3_INFO::Album, ID3_ALBUM}, {"TYER", "TYE", &ST_ID3_INFO::Year, ID3_YEAR},
+        {"COMM", "COM", &ST_ID3_INFO::Comment, ID3_COMMENT}, {"TCON", "TCO", &ST_ID3_INFO::Genre, ID3_GENRE},
         {"TCMP", "TCP", &ST_ID3_INFO::Compilation, ID3_COMPILATION},
         {"TCOM", "TCM", &ST_ID3_INFO::Composer, ID3_COMPOSER},
         {"TPE2", "TP2", &ST_ID3_INFO::AlbumArtist, ID3_ALBUMARTIST},
         {"TPOS", "TPA", &ST_ID3_INFO::DiscNumber, ID3_DISCNUMBER},
         {"TRCK", "TRK", &ST_ID3_INFO::CDTrackNumber, ID3_CDTRACKNUMBER},
-        {"TIT1", "TT1", &ST_ID3_INFO::Grouping, ID3_GROUPING},
-        {"TEXT", "TXT", &ST_ID3_INFO::Lyricist, ID3_LYRICIST},
-    };
+        {"TIT1", "TT1", &ST_ID3_INFO::Grouping, ID3_GROUPING}, {"TEXT", "TXT", &ST_ID3_INFO::Lyricist, ID3_LYRICIST}};
     const hova_string_format_et formats[] = {HOVA_STRING_FORMAT_ASCII, HOVA_STRING_FORMAT_UCS2,
                                              HOVA_STRING_FORMAT_UTF16BE, HOVA_STRING_FORMAT_UTF8};
     for (int version : {2, 3, 4}) {
@@ -97,17 +98,14 @@ TEST_F(Id3, DecodesTheTextFramesOfEveryVersionAndLaterFramesReplaceEarlierOnes) 
         }
         EXPECT_EQ(info().eID3TagFlags, all);
         EXPECT_EQ(cb_tell64(&reader), static_cast<cb_fpos>(ctx.id3_v2_size)) << "reader stands after the tag";
-        close();
     }
     const std::vector<Id3Frame> frames = {text_frame("TIT2", 0, text("first")),
                                           text_frame("TDRC", 0, text("2004-05")),
                                           text_frame("TIT2", 3, text("second"))};
     open(tkb::cat({tkb::id3_tag(4, tkb::id3_frames(4, frames)), kAudio}));
     ASSERT_EQ(parse(), 1);
-    hova_program_info_st program{};
-    get_id3_info(&program, &info());
-    EXPECT_EQ(program.year, 2004);
-    EXPECT_EQ(str(program.title), "second");
+    EXPECT_EQ(program().year, 2004);
+    EXPECT_EQ(str(program().title), "second");
     EXPECT_EQ(info().Title.stringformat, HOVA_STRING_FORMAT_UTF8);
 }
 
@@ -154,7 +152,6 @@ TEST_F(Id3, FindsTheTagInTheFirst257PositionsWithEveryBuffering) {
         uint8_t next = 0;
         ASSERT_EQ(reader.cb_read(&reader, &next, 1), 1);
         EXPECT_EQ(next, kAudio[0]);
-        close();
 
         open(tkb::cat({kAudio, v1}), opts);
         ASSERT_EQ(parse(), 1);
@@ -162,7 +159,6 @@ TEST_F(Id3, FindsTheTagInTheFirst257PositionsWithEveryBuffering) {
         EXPECT_EQ(cb_tell64(&reader), 0u) << "the end block is read and the reader put back";
         ASSERT_EQ(reader.cb_read(&reader, &next, 1), 1);
         EXPECT_EQ(next, kAudio[0]);
-        close();
     }
 }
 
@@ -208,11 +204,8 @@ TEST_F(Id3, PicturesFindTheirDataBehindTypeAndDescription) {
         EXPECT_EQ(info().Pic.payload, ctx.id3_info_buffer + info().pic_offset);
         EXPECT_EQ(Bytes(info().Pic.payload, info().Pic.payload + c.length),
                   Bytes(data.begin(), data.begin() + c.length));
-        hova_program_info_st program{};
-        get_id3_info(&program, &info());
-        EXPECT_EQ(program.cover.length, c.length);
-        EXPECT_EQ(program.pic_offset, static_cast<int>(info().pic_offset));
-        close();
+        EXPECT_EQ(std::make_pair(program().cover.length, program().pic_offset),
+                  std::make_pair(c.length, static_cast<int>(info().pic_offset)));
     }
 }
 
@@ -273,7 +266,6 @@ TEST_F(Id3, WalksTheFramesUntilPaddingOrABadSize) {
         if (c.flags & ID3_TITLE) { EXPECT_EQ(Bytes(info().Title.payload, info().Title.payload + info().Title.size), c.title); }
         if (c.log_line) { EXPECT_TRUE(log.contains(c.log_line)); }
         if (c.tag[5] & 0x80) { EXPECT_EQ(info().u32ID3TagSize, 11 + c.title.size()); }
-        close();
     }
 }
 
@@ -303,16 +295,11 @@ TEST_F(Id3, FallsBackToTheId3v1BlockAtTheEnd) {
                                                &info().Comment, &info().Genre};
         const int at[] = {31, 62, 93, 98, 129};
         for (int i = 0; i < 5; ++i) EXPECT_EQ(fields[i]->payload, ctx.id3_info_buffer + at[i]);
-        EXPECT_EQ(info().Year.stringformat, HOVA_STRING_FORMAT_ASCII);
-        EXPECT_EQ(ctx.id3_v1_size, 128);
-        EXPECT_EQ(cb_tell64(&reader), 0u);
-        EXPECT_EQ(input->counters().open_done_calls, 1u);
-        hova_program_info_st program{};
-        get_id3_info(&program, &info());
-        EXPECT_EQ(program.year, 1987);
-        ASSERT_NE(program.genre, nullptr);
-        EXPECT_STREQ(program.genre, "Rock");
-        close();
+        EXPECT_EQ(std::make_tuple(info().Year.stringformat, ctx.id3_v1_size, cb_tell64(&reader),
+                                  input->counters().open_done_calls),
+                  std::make_tuple(HOVA_STRING_FORMAT_ASCII, 128, cb_fpos{0}, uint64_t{1}));
+        EXPECT_EQ(program().year, 1987);
+        EXPECT_STREQ(program().genre, "Rock");
     }
     // The genre byte selects the genre name; 0 is an empty text.
     for (const auto& [genre, size, name] :
@@ -321,10 +308,8 @@ TEST_F(Id3, FallsBackToTheId3v1BlockAtTheEnd) {
         open(tkb::cat({kAudio, tkb::id3v1("t", "a", "b", "2000", "c", genre)}));
         ASSERT_EQ(parse(), 1);
         EXPECT_EQ(info().Genre.size, size) << int{genre};
-        hova_program_info_st program{};
-        get_id3_info(&program, &info());
-        EXPECT_STREQ(program.genre ? program.genre : "(none)", name ? name : "(none)") << int{genre};
-        close();
+        const char* got = program().genre;
+        EXPECT_STREQ(got ? got : "(none)", name ? name : "(none)") << int{genre};
     }
 }
 
@@ -353,13 +338,11 @@ TEST_F(Id3, LooksNoFurtherWhenThereIsNoTagToBeFound) {
         if (!c.size_known) ctx.file_size = ~cb_fpos{0};
         const uint64_t read_before = input->counters().bytes_read;
         EXPECT_EQ(parse(), 0);
-        EXPECT_EQ(ctx.id3_info_buffer, nullptr);
-        EXPECT_EQ(host.outstanding_blocks(), reader_blocks) << "only the reader's own blocks";
-        EXPECT_EQ(cb_tell64(&reader), 0u);
-        EXPECT_EQ(input->counters().open_done_calls, c.open_done);
+        EXPECT_EQ(std::make_tuple(ctx.id3_info_buffer, host.outstanding_blocks(), cb_tell64(&reader),
+                                  input->counters().open_done_calls),
+                  std::make_tuple(nullptr, reader_blocks, cb_fpos{0}, c.open_done));
         if (c.log_line) { EXPECT_TRUE(log.contains(c.log_line)); }
         if (c.open_done == 0) { EXPECT_LE(input->counters().bytes_read - read_before, c.file.size()); }
-        close();
     }
 }
 
@@ -391,7 +374,6 @@ TEST_F(Id3, RefusedBlocksAndTruncatedInputsNeverLeakOrOverread) {
         const int r = parse();
         EXPECT_EQ(r == 1, n >= tag.size() && n >= 266);
         EXPECT_EQ(ctx.id3_info_buffer != nullptr, r == 1);
-        close();
     }
 }
 
