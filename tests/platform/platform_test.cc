@@ -90,7 +90,9 @@ TEST(Utf16ToUtf8, MeasuresAndConvertsEachUnitWithinTheRange) {
     const uint8_t* t = three.data();
     EXPECT_EQ(get_UTF16_byte_length(a0_more.data(), a0_more.data() + 6), 4);
     EXPECT_EQ(get_UTF16_byte_length(zero_first.data(), zero_first.data() + 4), 2);
-    auto len = [](const uint8_t* b, const uint8_t* e) { return uint8_t(get_UTF16_byte_length(b, e)); };
+    auto len = [](const uint8_t* b, const uint8_t* e) {
+        return uint8_t(get_UTF16_byte_length(b, e));
+    };
     const Bytes lengths = {len(t, t + 3), len(t, t + 1), len(t, t), len(t + 2, t),
                            len(a0_more.data() + 4, a0_more.data() + 6)};
     EXPECT_EQ(lengths, (Bytes{3, 1, 0, 0, 2}));
@@ -102,7 +104,8 @@ TEST(Utf16ToUtf8, MeasuresAndConvertsEachUnitWithinTheRange) {
     EXPECT_EQ(out[0], 0x55) << "nothing written for an inverted range";
     ASSERT_EQ(log.lines().size(), 3u);
     EXPECT_EQ(log.lines()[0].text, "calculate UTF16 to UTF8 error : invalid input\n");
-    EXPECT_EQ(log.lines()[2].text, "convert UTF16 to UTF8 error : target is NULL or invalid input\n");
+    EXPECT_EQ(log.lines()[2].text,
+              "convert UTF16 to UTF8 error : target is NULL or invalid input\n");
 }
 
 }  // namespace

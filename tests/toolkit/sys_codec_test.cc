@@ -162,20 +162,25 @@ TEST(Ac3Channels, FindsLfeAfterTheModeFieldsAndScansForAUsableHeader) {
     for (int acmod = 0; acmod < 16; ++acmod) {
         int ac3 = -1, eac3 = -1, lfe = acmod / 8;
         EXPECT_EQ(sys_get_ac3_channel_count(tkb::ac3_frame(acmod % 8, lfe).data(), 16, 0, &ac3), 1);
-        EXPECT_EQ(sys_get_ac3_channel_count(tkb::eac3_frame(acmod % 8, lfe).data(), 13, 1, &eac3), 1);
+        EXPECT_EQ(sys_get_ac3_channel_count(tkb::eac3_frame(acmod % 8, lfe).data(), 13, 1, &eac3),
+                  1);
         EXPECT_EQ(std::make_pair(ac3, eac3), std::make_pair(full_range[acmod % 8] + lfe,
                                                             full_range[acmod % 8] + lfe)) << acmod;
     }
     const struct {
         Bytes bytes;
         int eac3, result, channels;
-    } cases[] = {
-        {cat({{0x0B, 0x00, 0x77, 0x0B}, tkb::ac3_frame(7, 1)}), 0, 1, 6},
-        {cat({tkb::ac3_frame(7, 1, 38, 0), tkb::ac3_frame(2, 0)}), 0, 1, 2},
-        {tkb::ac3_frame(2, 1, 37), 0, 1, 3}, {tkb::ac3_frame(7, 1, 63), 0, -1, -1},
-        {{0x0B, 0x77, 0, 0, 0x0A, 0x40}, 0, -1, -1}, {{0x0B, 0x77, 0, 0, 0x0A, 0x40, 0x40}, 0, 1, 2},
-        {{0x0B, 0x77, 0, 0, 0x0F}, 1, 1, 6}, {{0x0B, 0x77, 0, 0}, 1, -1, -1},
-        {{0, 0, 0, 0, 0, 0, 0x0B}, 0, -1, -1}, {Bytes(64, 0x77), 0, -1, -1}, {{}, 0, -1, -1}};
+    } cases[] = {{cat({{0x0B, 0x00, 0x77, 0x0B}, tkb::ac3_frame(7, 1)}), 0, 1, 6},
+                 {cat({tkb::ac3_frame(7, 1, 38, 0), tkb::ac3_frame(2, 0)}), 0, 1, 2},
+                 {tkb::ac3_frame(2, 1, 37), 0, 1, 3},
+                 {tkb::ac3_frame(7, 1, 63), 0, -1, -1},
+                 {{0x0B, 0x77, 0, 0, 0x0A, 0x40}, 0, -1, -1},
+                 {{0x0B, 0x77, 0, 0, 0x0A, 0x40, 0x40}, 0, 1, 2},
+                 {{0x0B, 0x77, 0, 0, 0x0F}, 1, 1, 6},
+                 {{0x0B, 0x77, 0, 0}, 1, -1, -1},
+                 {{0, 0, 0, 0, 0, 0, 0x0B}, 0, -1, -1},
+                 {Bytes(64, 0x77), 0, -1, -1},
+                 {{}, 0, -1, -1}};
     for (const auto& c : cases) {
         int channels = -1;
         EXPECT_EQ(sys_get_ac3_channel_count(c.bytes.data(), static_cast<int>(c.bytes.size()),

@@ -62,6 +62,7 @@ protected:
 const Bytes kAudio = tkb::pattern(400, 3);
 
 TEST_F(Id3, DecodesTheTextFramesOfEveryVersionAndLaterFramesReplaceEarlierOnes) {
+    using I = ST_ID3_INFO;
     struct Item {
         const char* id3;
         const char* id2;
@@ -69,15 +70,15 @@ TEST_F(Id3, DecodesTheTextFramesOfEveryVersionAndLaterFramesReplaceEarlierOnes) 
         uint32_t flag;
     };
     const Item items[] = {
-        {"TIT2", "TT2", &ST_ID3_INFO::Title, ID3_TITLE}, {"TPE1", "TP1", &ST_ID3_INFO::Artist, ID3_ARTIST},
-        {"TALB", "TAL", &ST_ID3_INFO::Album, ID3_ALBUM}, {"TYER", "TYE", &ST_ID3_INFO::Year, ID3_YEAR},
-        {"COMM", "COM", &ST_ID3_INFO::Comment, ID3_COMMENT}, {"TCON", "TCO", &ST_ID3_INFO::Genre, ID3_GENRE},
-        {"TCMP", "TCP", &ST_ID3_INFO::Compilation, ID3_COMPILATION},
-        {"TCOM", "TCM", &ST_ID3_INFO::Composer, ID3_COMPOSER},
-        {"TPE2", "TP2", &ST_ID3_INFO::AlbumArtist, ID3_ALBUMARTIST},
-        {"TPOS", "TPA", &ST_ID3_INFO::DiscNumber, ID3_DISCNUMBER},
-        {"TRCK", "TRK", &ST_ID3_INFO::CDTrackNumber, ID3_CDTRACKNUMBER},
-        {"TIT1", "TT1", &ST_ID3_INFO::Grouping, ID3_GROUPING}, {"TEXT", "TXT", &ST_ID3_INFO::Lyricist, ID3_LYRICIST}};
+        {"TIT2", "TT2", &I::Title, ID3_TITLE}, {"TPE1", "TP1", &I::Artist, ID3_ARTIST},
+        {"TALB", "TAL", &I::Album, ID3_ALBUM}, {"TYER", "TYE", &I::Year, ID3_YEAR},
+        {"COMM", "COM", &I::Comment, ID3_COMMENT}, {"TCON", "TCO", &I::Genre, ID3_GENRE},
+        {"TCMP", "TCP", &I::Compilation, ID3_COMPILATION},
+        {"TCOM", "TCM", &I::Composer, ID3_COMPOSER},
+        {"TPE2", "TP2", &I::AlbumArtist, ID3_ALBUMARTIST},
+        {"TPOS", "TPA", &I::DiscNumber, ID3_DISCNUMBER},
+        {"TRCK", "TRK", &I::CDTrackNumber, ID3_CDTRACKNUMBER},
+        {"TIT1", "TT1", &I::Grouping, ID3_GROUPING}, {"TEXT", "TXT", &I::Lyricist, ID3_LYRICIST}};
     const hova_string_format_et formats[] = {HOVA_STRING_FORMAT_ASCII, HOVA_STRING_FORMAT_UCS2,
                                              HOVA_STRING_FORMAT_UTF16BE, HOVA_STRING_FORMAT_UTF8};
     for (int version : {2, 3, 4}) {

@@ -20,7 +20,8 @@ TEST(LanguageCodes, EveryIso639_1CodeMapsToItsBibliographicCodeComparingTwoBytes
     const nlohmann::json doc = nlohmann::json::parse(f);
     for (const auto& e : doc.at("639-2"))
         if (e.contains("alpha_2"))
-            expected[e.at("alpha_2")] = e.value("bibliographic", e.at("alpha_3").get<std::string>());
+            expected[e.at("alpha_2")] =
+                e.value("bibliographic", e.at("alpha_3").get<std::string>());
     ASSERT_EQ(expected.size(), 186u) << "the independent list changed shape";
     for (const auto& [two, three] : expected) {
         const char* got = sys_alpha2_to_alpha3(two.c_str());
@@ -40,7 +41,8 @@ TEST(Genres, IndexLimitsAndNames) {
     for (int index : {149, -1, INT_MIN}) EXPECT_EQ(sys_index_to_genre(index), nullptr) << index;
     hova_data_info_st info{123, reinterpret_cast<unsigned char*>(&info)};
     sys_set_info_from_string(&info, nullptr);
-    EXPECT_EQ(std::make_pair(info.length, info.payload), std::make_pair(0, (unsigned char*)nullptr));
+    EXPECT_EQ(std::make_pair(info.length, info.payload),
+              std::make_pair(0, (unsigned char*)nullptr));
     char abc[] = "abc", empty[] = "";
     sys_set_info_from_string(&info, abc);
     EXPECT_EQ(std::make_pair(info.length, info.payload), std::make_pair(4, (unsigned char*)abc));

@@ -10,7 +10,8 @@
 namespace {
 
 using tkb::Bytes;
-constexpr hova_stream_type_et A = HOVA_STREAM_AUDIO, V = HOVA_STREAM_VIDEO, S = HOVA_STREAM_SUBTITLE;
+constexpr hova_stream_type_et A = HOVA_STREAM_AUDIO, V = HOVA_STREAM_VIDEO;
+constexpr hova_stream_type_et S = HOVA_STREAM_SUBTITLE;
 
 struct Step {
     hova_stream_type_et type;
@@ -34,7 +35,8 @@ TEST(PtsGapRepair, KeepsTimelineContinuousAcrossJumpsOfMoreThanThirtySecondsAndL
              {V, 60040000, 80000}}, 60000000 - 40000},  // a gap on audio shifts video too
         {0, {{A, 0, 0}, {A, 100000000, 0}, {A, -1, -1}, {A, 100020000, 20000}}, 100000000},
         {0, {{V, 0, 0}, {V, 90000000, 0}, {S, 90000000, 90000000}}, 90000000},
-        {0, {{V, INT64_MAX, 0}, {V, INT64_MIN, int64_t(uint64_t(INT64_MIN) - INT64_MAX)}}, INT64_MAX}};
+        {0, {{V, INT64_MAX, 0}, {V, INT64_MIN, int64_t(uint64_t(INT64_MIN) - INT64_MAX)}},
+         INT64_MAX}};
     for (const auto& c : cases) {
         sys_demuxer_st d;
         std::memset(&d, 0xA5, sizeof d);  // nothing may depend on fields the start leaves alone
@@ -56,7 +58,8 @@ TEST(PtsGapRepair, KeepsTimelineContinuousAcrossJumpsOfMoreThanThirtySecondsAndL
               std::make_tuple(2080000, 40000, 2000000, -1));  // the gap moved on by the known step
     int64_t pts = 99000000;  // other kinds: entry 2 holds the raw time, its step stays reset
     sys_update_and_fix_pts_gap(&d, &pts, HOVA_STREAM_ID3_METADATA);
-    EXPECT_EQ(std::make_tuple(pts, d.last_pts[2], d.last_dur[2]), std::make_tuple(99000000, 99000000, -1));
+    EXPECT_EQ(std::make_tuple(pts, d.last_pts[2], d.last_dur[2]),
+              std::make_tuple(99000000, 99000000, -1));
     ASSERT_EQ(log.lines().size(), 2u);
     EXPECT_EQ(log.lines()[0].text, "[SYS] found pts gap for type 3, pts 99000000, orignal pts "
                                    "99000000, last pts 2040000, last dur 40000\n");
@@ -78,9 +81,10 @@ TEST(DropTarget, OtherKindsDropUntilTheReaderReachesTheFirstTargetThenForgetIt) 
         sys_set_drop_target(V, &audio, at);
         sys_set_drop_target(V, &video, at);  // the targeted kind has none
     }
-    EXPECT_EQ(std::make_pair(audio.next_pos, video.next_pos), (std::pair<uint64_t, uint64_t>(0x100000000ull, UINT64_MAX)));
-    for (const auto& [reader_at, drop] : {std::pair{0ull, 1}, {0xFFFFFFFFull, 1}, {0x100000000ull, 0},
-                                          {0ull, 0}}) {
+    EXPECT_EQ(audio.next_pos, 0x100000000ull);
+    EXPECT_EQ(video.next_pos, UINT64_MAX);
+    for (const auto& [reader_at, drop] :
+         {std::pair{0ull, 1}, {0xFFFFFFFFull, 1}, {0x100000000ull, 0}, {0ull, 0}}) {
         d.cbuffer.curpos = reader_at;
         EXPECT_EQ(sys_check_drop(&d, &audio), drop) << "reader at " << reader_at;
     }

@@ -48,7 +48,12 @@ struct Asc {
 };
 // Object type, rate index, channel configuration, then 3 zero GASpecificConfig bits.
 inline Bytes asc_bytes(const Asc& a) {
-    return BitWriter().put(a.object_type, 5).put(a.sf_index, 4).put(a.channel_config, 4).put(0, 3).bytes();
+    return BitWriter()
+        .put(a.object_type, 5)
+        .put(a.sf_index, 4)
+        .put(a.channel_config, 4)
+        .put(0, 3)
+        .bytes();
 }
 // One ADTS header (7 bytes, no CRC) followed by `payload` zero bytes.
 inline Bytes adts_frame(int sf_index, int channel_config, int payload = 0, int profile = 1,
