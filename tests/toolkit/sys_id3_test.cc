@@ -22,7 +22,8 @@ using tkb::text;
 using tkb::text_frame;
 
 std::string str(const hova_string_info_st& s) {
-    return s.payload ? std::string(reinterpret_cast<const char*>(s.payload), s.size) : std::string();
+    return s.payload ? std::string(reinterpret_cast<const char*>(s.payload), s.size)
+                     : std::string();
 }
 
 class Id3 : public HostedToolkit {
@@ -86,7 +87,8 @@ TEST_F(Id3, DecodesTheTextFramesOfEveryVersionAndLaterFramesReplaceEarlierOnes) 
         std::vector<Id3Frame> frames;
         for (size_t i = 0; i < std::size(items); ++i)
             frames.push_back(text_frame(version == 2 ? items[i].id2 : items[i].id3,
-                                        static_cast<uint8_t>(i % 4), text(std::string("value ") + items[i].id3)));
+                                        static_cast<uint8_t>(i % 4),
+                                        text(std::string("value ") + items[i].id3)));
         open(tkb::cat({tkb::id3_tag(version, tkb::id3_frames(version, frames), 20), kAudio}));
         ASSERT_EQ(parse(), 1);
         uint32_t all = 0;
@@ -98,7 +100,8 @@ TEST_F(Id3, DecodesTheTextFramesOfEveryVersionAndLaterFramesReplaceEarlierOnes) 
             all |= items[i].flag;
         }
         EXPECT_EQ(info().eID3TagFlags, all);
-        EXPECT_EQ(cb_tell64(&reader), static_cast<cb_fpos>(ctx.id3_v2_size)) << "reader stands after the tag";
+        EXPECT_EQ(cb_tell64(&reader), static_cast<cb_fpos>(ctx.id3_v2_size))
+            << "reader stands after the tag";
     }
     const std::vector<Id3Frame> frames = {text_frame("TIT2", 0, text("first")),
                                           text_frame("TDRC", 0, text("2004-05")),
@@ -118,12 +121,15 @@ TEST_F(Id3, FindsTheTagInTheFirst257PositionsWithEveryBuffering) {
                   probe.begin() + static_cast<long>(at));
         int pos = -1, size = -1;
         EXPECT_EQ(find_ID3v2(probe.data(), 266, &pos, &size), found) << at;
-        if (found) { EXPECT_EQ(std::make_pair(pos, size), std::make_pair(static_cast<int>(at), 110)); }
+        if (found) {
+            EXPECT_EQ(std::make_pair(pos, size), std::make_pair(static_cast<int>(at), 110));
+        }
     }
     {
         testenv::LogCapture log;
         int pos = 0, size = 0;
-        EXPECT_EQ(find_ID3v2(reinterpret_cast<const uint8_t*>("ID3\3\0\0\0\0\0"), 9, &pos, &size), 0);
+        EXPECT_EQ(find_ID3v2(reinterpret_cast<const uint8_t*>("ID3\3\0\0\0\0\0"), 9, &pos, &size),
+                  0);
         EXPECT_TRUE(log.contains("findID3v2 : Not enough input data\n"));
     }
     host::InputOptions none, small_cache, ring;
@@ -135,8 +141,9 @@ TEST_F(Id3, FindsTheTagInTheFirst257PositionsWithEveryBuffering) {
     ring.ring_size = 8192;
     // A tag larger than the probe, read in two parts, behind 256 bytes of other data.
     const Bytes picture = tkb::pattern(39000, 0x11);
-    const Bytes body = tkb::id3_frames(3, {{"APIC", tkb::cat({Bytes{0}, text("image/png"), Bytes{0, 3, 0}, picture})},
-                                           text_frame("TALB", 0, text("tail"))});
+    const Bytes body = tkb::id3_frames(
+        3, {{"APIC", tkb::cat({Bytes{0}, text("image/png"), Bytes{0, 3, 0}, picture})},
+            text_frame("TALB", 0, text("tail"))});
     const Bytes v2 = tkb::id3_tag(3, body, 40000 - 10 - body.size());
     const Bytes v1 = tkb::id3v1("one", "a", "b", "1999", "c", 2);
     for (const host::InputOptions& opts : {host::InputOptions{}, none, small_cache, ring}) {
@@ -255,10 +262,13 @@ TEST_F(Id3, FallsBackToTheId3v1BlockAtTheEnd) {
         const char* log_line;
     } cases[] = {
         {"no ID3v2 tag", kAudio, "[parse_ID3] find_ID3v2 fail\n"},
-        {"ID3v2 version 5", tkb::cat({tkb::id3_tag(5, tkb::id3_frames(3, {text_frame("TIT2", 0, text("v5"))})), kAudio}),
+        {"ID3v2 version 5",
+         tkb::cat(
+             {tkb::id3_tag(5, tkb::id3_frames(3, {text_frame("TIT2", 0, text("v5"))})), kAudio}),
          "[parseID3v2] unsupport ID3v2 version\n"},
         {"ID3v2 tag longer than the input",
-         tkb::cat({Bytes{'I', 'D', '3', 3, 0, 0, 0x7F, 0x7F, 0x7F, 0x7F}, kAudio}), "[parse_ID3] cb_read fail\n"},
+         tkb::cat({Bytes{'I', 'D', '3', 3, 0, 0, 0x7F, 0x7F, 0x7F, 0x7F}, kAudio}),
+         "[parse_ID3] cb_read fail\n"},
     };
     const Bytes v1 = tkb::id3v1("Song", "Band", "Record", "1987", "fine", 17);
     for (const auto& c : cases) {
@@ -282,8 +292,11 @@ TEST_F(Id3, FallsBackToTheId3v1BlockAtTheEnd) {
     }
     // The genre byte selects the genre name; 0 is an empty text.
     for (const auto& [genre, size, name] :
-         {std::tuple<uint8_t, unsigned, const char*>{0, 1, nullptr}, {147, 2, "Synthpop"}, {148, 2, ""},
-          {149, 2, nullptr}, {255, 2, nullptr}}) {
+         {std::tuple<uint8_t, unsigned, const char*>{0, 1, nullptr},
+          {147, 2, "Synthpop"},
+          {148, 2, ""},
+          {149, 2, nullptr},
+          {255, 2, nullptr}}) {
         open(tkb::cat({kAudio, tkb::id3v1("t", "a", "b", "2000", "c", genre)}));
         ASSERT_EQ(parse(), 1);
         EXPECT_EQ(info().Genre.size, size) << int{genre};
@@ -317,11 +330,13 @@ TEST_F(Id3, LooksNoFurtherWhenThereIsNoTagToBeFound) {
         if (!c.size_known) ctx.file_size = ~cb_fpos{0};
         const uint64_t read_before = input->counters().bytes_read;
         EXPECT_EQ(parse(), 0);
-        EXPECT_EQ(std::make_tuple(ctx.id3_info_buffer, host.outstanding_blocks(), cb_tell64(&reader),
-                                  input->counters().open_done_calls),
+        EXPECT_EQ(std::make_tuple(ctx.id3_info_buffer, host.outstanding_blocks(),
+                                  cb_tell64(&reader), input->counters().open_done_calls),
                   std::make_tuple(nullptr, reader_blocks, cb_fpos{0}, c.open_done));
         if (c.log_line) { EXPECT_TRUE(log.contains(c.log_line)); }
-        if (c.open_done == 0) { EXPECT_LE(input->counters().bytes_read - read_before, c.file.size()); }
+        if (c.open_done == 0) {
+            EXPECT_LE(input->counters().bytes_read - read_before, c.file.size());
+        }
     }
 }
 
@@ -340,12 +355,17 @@ TEST_F(Id3, RefusedBlocksAndTruncatedInputsNeverLeakOrOverread) {
             const int r = parse();
             host.fail_malloc_at(0);
             EXPECT_EQ(host.outstanding_blocks(), reader_blocks + (r == 1));
-            if (r == 1) { EXPECT_TRUE(str(info().Title) == "two" || str(info().Title) == std::string("one") + '\0'); }
+            if (r == 1) {
+                EXPECT_TRUE(str(info().Title) == "two" ||
+                            str(info().Title) == std::string("one") + '\0');
+            }
             close();
         }
     }
-    const Bytes tag = tkb::id3_tag(4, tkb::id3_frames(4, {text_frame("TIT2", 0, text("title")),
-                                                          {"APIC", tkb::cat({Bytes{0}, text("a/b"), Bytes{0, 3, 0}, tkb::pattern(300, 1)})}}));
+    const Bytes tag = tkb::id3_tag(
+        4, tkb::id3_frames(4, {text_frame("TIT2", 0, text("title")),
+                               {"APIC", tkb::cat({Bytes{0}, text("a/b"), Bytes{0, 3, 0},
+                                                  tkb::pattern(300, 1)})}}));
     const Bytes file = tkb::cat({tag, tkb::pattern(100, 2)});
     for (size_t n = 0; n <= file.size(); n += 7) {
         SCOPED_TRACE(n);
