@@ -14,20 +14,17 @@ using Bytes = std::vector<uint8_t>;
 class BitWriter {
 public:
     BitWriter& put(uint64_t value, int bits) {
-        for (int i = bits - 1; i >= 0; --i) {
+        for (int i = bits - 1; i >= 0; --i, ++used_) {
             if (used_ % 8 == 0) bytes_.push_back(0);
             if ((value >> i) & 1) bytes_.back() |= static_cast<uint8_t>(0x80 >> (used_ % 8));
-            ++used_;
         }
         return *this;
     }
     // LatmGetValue: 2-bit byte count minus one, then the value in that many bytes.
     BitWriter& latm_value(uint32_t v) {
-        int n = v < 0x100 ? 1 : v < 0x10000 ? 2 : v < 0x1000000 ? 3 : 4;
-        put(static_cast<uint64_t>(n - 1), 2);
-        return put(v, 8 * n);
+        const int n = v < 0x100 ? 1 : v < 0x10000 ? 2 : v < 0x1000000 ? 3 : 4;
+        return put(static_cast<uint64_t>(n - 1), 2).put(v, 8 * n);
     }
-    size_t bits() const { return used_; }
     Bytes bytes() const { return bytes_; }
 
 private:
@@ -40,37 +37,31 @@ inline Bytes cat(std::initializer_list<Bytes> parts) {
     for (const auto& p : parts) out.insert(out.end(), p.begin(), p.end());
     return out;
 }
+inline Bytes padded(Bytes b, size_t extra, uint8_t fill = 0) {
+    b.resize(b.size() + extra, fill);
+    return b;
+}
 
 // ---- AAC ----
-
 struct Asc {
-    int object_type = 2;
-    int sf_index = 4;
-    int channel_config = 2;
+    int object_type = 2, sf_index = 4, channel_config = 2;
 };
-
-inline void put_asc(BitWriter& w, const Asc& a) {
-    w.put(a.object_type, 5).put(a.sf_index, 4).put(a.channel_config, 4);
-    w.put(0, 3);  // GASpecificConfig: frame length, core coder, extension flags
-}
-
+// Object type, rate index, channel configuration, then 3 zero GASpecificConfig bits.
 inline Bytes asc_bytes(const Asc& a) {
-    BitWriter w;
-    put_asc(w, a);
-    return w.bytes();
+    return BitWriter()
+        .put(a.object_type, 5)
+        .put(a.sf_index, 4)
+        .put(a.channel_config, 4)
+        .put(0, 3)
+        .bytes();
 }
-
 // One ADTS header (7 bytes, no CRC) followed by `payload` zero bytes.
 inline Bytes adts_frame(int sf_index, int channel_config, int payload = 0, int profile = 1,
                         int layer = 0) {
     BitWriter w;
-    w.put(0xFFF, 12).put(0, 1).put(layer, 2).put(1, 1);  // sync, MPEG-4, layer, no CRC
-    w.put(profile, 2).put(sf_index, 4).put(0, 1).put(channel_config, 3);
-    w.put(0, 4);                                          // original, home, copyright bits
-    w.put(7 + payload, 13).put(0x7FF, 11).put(0, 2);
-    Bytes b = w.bytes();
-    b.resize(b.size() + payload, 0);
-    return b;
+    w.put(0xFFF, 12).put(0, 1).put(layer, 2).put(1, 1).put(profile, 2).put(sf_index, 4);
+    w.put(0, 1).put(channel_config, 3).put(0, 4).put(7 + payload, 13).put(0x7FF, 11).put(0, 2);
+    return padded(w.bytes(), static_cast<size_t>(payload));
 }
 
 struct LoasLayer {
@@ -78,51 +69,42 @@ struct LoasLayer {
     Asc asc;
     int asc_pad_bits = 0;          // zero bits behind the 13 ASC bits (its length, version 1)
 };
-
 struct LoasConfig {
     bool use_same_stream_mux = false;
     int mux_version = 0;
     std::vector<std::vector<LoasLayer>> programs{{LoasLayer{}}};
 };
-
-// One AudioMuxElement in a LOAS AudioSyncStream frame.
+// One AudioMuxElement in a LOAS AudioSyncStream frame; the frame length fields
+// are written once, after the last layer (the toolkit reads configs only).
 inline Bytes loas_frame(const LoasConfig& c, int payload = 4) {
-    BitWriter body;
-    body.put(c.use_same_stream_mux ? 1 : 0, 1);
+    BitWriter b;
+    b.put(c.use_same_stream_mux ? 1 : 0, 1);
     if (!c.use_same_stream_mux) {
-        body.put(c.mux_version, 1);
-        if (c.mux_version == 1) body.put(0, 1).latm_value(0xFF);
-        body.put(1, 1).put(0, 6).put(c.programs.size() - 1, 4);
+        b.put(c.mux_version, 1);
+        if (c.mux_version == 1) b.put(0, 1).latm_value(0xFF);
+        b.put(1, 1).put(0, 6).put(c.programs.size() - 1, 4);
         for (size_t p = 0; p < c.programs.size(); ++p) {
-            body.put(c.programs[p].size() - 1, 3);
+            b.put(c.programs[p].size() - 1, 3);
             for (size_t l = 0; l < c.programs[p].size(); ++l) {
-                const LoasLayer& layer = c.programs[p][l];
+                const LoasLayer& y = c.programs[p][l];
                 if (p != 0 || l != 0) {
-                    body.put(layer.use_same_config ? 1 : 0, 1);
-                    if (layer.use_same_config) continue;
+                    b.put(y.use_same_config ? 1 : 0, 1);
+                    if (y.use_same_config) continue;
                 }
-                if (c.mux_version == 1) body.latm_value(static_cast<uint32_t>(layer.asc_pad_bits));
-                body.put(layer.asc.object_type, 5).put(layer.asc.sf_index, 4).put(layer.asc.channel_config, 4);
-                body.put(0, layer.asc_pad_bits);
+                if (c.mux_version == 1) b.latm_value(static_cast<uint32_t>(y.asc_pad_bits));
+                b.put(y.asc.object_type, 5).put(y.asc.sf_index, 4).put(y.asc.channel_config, 4);
+                b.put(0, y.asc_pad_bits);
             }
         }
-        // Frame length fields are written once, after the last layer: the
-        // toolkit reads configs only, and several layers stay back to back.
-        body.put(0, 3).put(0xFF, 8);  // frameLengthType 0, latmBufferFullness
-        body.put(0, 1).put(0, 1);  // no other data, no CRC
+        b.put(0, 3).put(0xFF, 8).put(0, 2);  // frameLengthType 0, fullness, no other data, CRC
     }
-    for (int i = 0; i < payload; ++i) body.put(0xA5, 8);
-    Bytes b = body.bytes();
-    BitWriter head;
-    head.put(0x2B7, 11).put(b.size(), 13);
-    Bytes out = head.bytes();
-    out.insert(out.end(), b.begin(), b.end());
-    return out;
+    for (int i = 0; i < payload; ++i) b.put(0xA5, 8);
+    const Bytes body = b.bytes();
+    return cat({BitWriter().put(0x2B7, 11).put(body.size(), 13).bytes(), body});
 }
 
 // ---- Dolby ----
-
-// AC-3 sync frame header (bit stream information up to lfeon), padded.
+// AC-3 sync frame header (bit stream information up to dialnorm), padded.
 inline Bytes ac3_frame(int acmod, int lfeon, int frmsizecod = 10, int pad = 8) {
     BitWriter w;
     w.put(0x0B77, 16).put(0x1234, 16).put(0, 2).put(frmsizecod, 6).put(8, 5).put(0, 3);
@@ -130,40 +112,26 @@ inline Bytes ac3_frame(int acmod, int lfeon, int frmsizecod = 10, int pad = 8) {
     if ((acmod & 1) && acmod != 1) w.put(1, 2);  // centre mix level
     if (acmod & 4) w.put(1, 2);                  // surround mix level
     if (acmod == 2) w.put(2, 2);                 // Dolby surround mode
-    w.put(lfeon, 1).put(0x1F, 5);                // dialnorm
-    Bytes b = w.bytes();
-    b.resize(b.size() + pad, 0);
-    return b;
+    return padded(w.put(lfeon, 1).put(0x1F, 5).bytes(), static_cast<size_t>(pad));
 }
-
 inline Bytes eac3_frame(int acmod, int lfeon, int pad = 8) {
     BitWriter w;
-    w.put(0x0B77, 16).put(0, 2).put(0, 3).put(255, 11);  // strmtyp, substreamid, frmsiz
-    w.put(0, 2).put(3, 2).put(acmod, 3).put(lfeon, 1).put(16, 5);
-    Bytes b = w.bytes();
-    b.resize(b.size() + pad, 0);
-    return b;
+    w.put(0x0B77, 16).put(0, 5).put(255, 11).put(0, 2).put(3, 2).put(acmod, 3).put(lfeon, 1);
+    return padded(w.put(16, 5).bytes(), static_cast<size_t>(pad));
 }
 
 // ---- AVC ----
-
-inline Bytes avcc(const std::vector<Bytes>& sps, const std::vector<Bytes>& pps, int nal_length_size = 4) {
+inline Bytes avcc(const std::vector<Bytes>& sps, const std::vector<Bytes>& pps,
+                  int nal_length_size = 4) {
     Bytes b = {1, 0x64, 0x00, 0x1F, static_cast<uint8_t>(0xFC | (nal_length_size - 1)),
                static_cast<uint8_t>(0xE0 | sps.size())};
-    for (const auto& s : sps) {
-        b.push_back(static_cast<uint8_t>(s.size() >> 8));
-        b.push_back(static_cast<uint8_t>(s.size()));
-        b.insert(b.end(), s.begin(), s.end());
-    }
-    b.push_back(static_cast<uint8_t>(pps.size()));
-    for (const auto& p : pps) {
-        b.push_back(static_cast<uint8_t>(p.size() >> 8));
-        b.push_back(static_cast<uint8_t>(p.size()));
-        b.insert(b.end(), p.begin(), p.end());
+    for (const auto* list : {&sps, &pps}) {
+        if (list == &pps) b.push_back(static_cast<uint8_t>(pps.size()));
+        for (const auto& s : *list)
+            b = cat({b, {static_cast<uint8_t>(s.size() >> 8), static_cast<uint8_t>(s.size())}, s});
     }
     return b;
 }
-
 inline Bytes pattern(size_t n, uint8_t seed) {
     Bytes b(n);
     for (size_t i = 0; i < n; ++i) b[i] = static_cast<uint8_t>(seed + i * 7);
@@ -171,76 +139,53 @@ inline Bytes pattern(size_t n, uint8_t seed) {
 }
 
 // ---- ID3 ----
-
-inline Bytes syncsafe(uint32_t v) {
-    return {static_cast<uint8_t>((v >> 21) & 0x7F), static_cast<uint8_t>((v >> 14) & 0x7F),
-            static_cast<uint8_t>((v >> 7) & 0x7F), static_cast<uint8_t>(v & 0x7F)};
-}
-
-inline Bytes be(uint32_t v, int n) {
+inline Bytes be(uint32_t v, int n, int bits = 8) {
     Bytes b;
-    for (int i = n - 1; i >= 0; --i) b.push_back(static_cast<uint8_t>(v >> (8 * i)));
+    for (int i = n - 1; i >= 0; --i) b.push_back(static_cast<uint8_t>((v >> (bits * i)) & 0xFF));
+    if (bits == 7) for (auto& x : b) x &= 0x7F;
     return b;
 }
-
+inline Bytes syncsafe(uint32_t v) { return be(v, 4, 7); }
 inline Bytes text(const std::string& s) { return Bytes(s.begin(), s.end()); }
 
 struct Id3Frame {
     std::string id;
     Bytes body;
-    // Size field override (as stored, before encoding): -1 uses body.size().
-    int64_t stored_size = -1;
+    int64_t stored_size = -1;    // size field as stored (before encoding); -1: body.size()
     bool plain_size_v4 = false;  // write a v2.4 size big-endian instead of syncsafe
 };
-
 inline Id3Frame text_frame(const std::string& id, uint8_t encoding, const Bytes& value) {
-    Bytes body{encoding};
-    body.insert(body.end(), value.begin(), value.end());
-    return {id, body};
+    return {id, cat({{encoding}, value})};
 }
-
 // The frames of a tag as stored for `version` (2, 3 or 4).
 inline Bytes id3_frames(int version, const std::vector<Id3Frame>& frames) {
     Bytes out;
     for (const auto& f : frames) {
-        const uint32_t size = f.stored_size >= 0 ? static_cast<uint32_t>(f.stored_size)
-                                                 : static_cast<uint32_t>(f.body.size());
+        const auto size = static_cast<uint32_t>(f.stored_size >= 0 ? f.stored_size
+                                                                   : int64_t(f.body.size()));
         Bytes id = text(f.id);
         id.resize(version == 2 ? 3 : 4, 0);
-        out.insert(out.end(), id.begin(), id.end());
-        Bytes sz = version == 2 ? be(size, 3)
-                 : (version == 4 && !f.plain_size_v4) ? syncsafe(size) : be(size, 4);
-        out.insert(out.end(), sz.begin(), sz.end());
-        if (version != 2) out.insert(out.end(), {0, 0});
-        out.insert(out.end(), f.body.begin(), f.body.end());
+        const Bytes sz = version == 2 ? be(size, 3)
+                       : (version == 4 && !f.plain_size_v4) ? syncsafe(size) : be(size, 4);
+        out = cat({out, id, sz, version == 2 ? Bytes{} : Bytes{0, 0}, f.body});
     }
     return out;
 }
-
 // A whole tag: header, the given body (frames or anything else), padding.
 inline Bytes id3_tag(int version, const Bytes& body, size_t padding = 0, uint8_t flags = 0) {
-    Bytes out = {'I', 'D', '3', static_cast<uint8_t>(version), 0, flags};
-    Bytes sz = syncsafe(static_cast<uint32_t>(body.size() + padding));
-    out.insert(out.end(), sz.begin(), sz.end());
-    out.insert(out.end(), body.begin(), body.end());
-    out.resize(out.size() + padding, 0);
-    return out;
+    const Bytes head = {'I', 'D', '3', static_cast<uint8_t>(version), 0, flags};
+    return padded(cat({head, syncsafe(static_cast<uint32_t>(body.size() + padding)), body}),
+                  padding);
 }
-
 // The 128-byte ID3v1 block.
 inline Bytes id3v1(const std::string& title, const std::string& artist, const std::string& album,
                    const std::string& year, const std::string& comment, uint8_t genre) {
     Bytes out = text("TAG");
-    auto field = [&out](const std::string& s, size_t width) {
-        Bytes f(width, 0);
-        for (size_t i = 0; i < s.size() && i < width; ++i) f[i] = static_cast<uint8_t>(s[i]);
-        out.insert(out.end(), f.begin(), f.end());
-    };
-    field(title, 30);
-    field(artist, 30);
-    field(album, 30);
-    field(year, 4);
-    field(comment, 30);
+    for (const auto& [s, width] : {std::pair{title, 30}, {artist, 30}, {album, 30}, {year, 4},
+                                   {comment, 30}}) {
+        Bytes f = text(s.substr(0, width));
+        out = cat({out, padded(f, static_cast<size_t>(width) - f.size())});
+    }
     out.push_back(genre);
     return out;
 }

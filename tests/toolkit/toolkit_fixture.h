@@ -4,18 +4,14 @@
 
 #include <gtest/gtest.h>
 
-#include <cstring>
-
 #include "callbacks.h"
 #include "sys_demuxer.h"
 #include "sys_output.h"
+#include "toolkit_builders.h"
 
 class HostedToolkit : public ::testing::Test {
 protected:
-    HostedToolkit() {
-        std::memset(&d, 0, sizeof d);
-        d.callback = *host.table();
-    }
+    HostedToolkit() { d.callback = *host.table(); }
     void TearDown() override {
         EXPECT_EQ(host.outstanding_blocks(), 0u) << "the host still holds toolkit blocks";
         EXPECT_EQ(host.foreign_frees(), 0u);
@@ -24,5 +20,5 @@ protected:
     void release(T*& p) { sys_free(&d, p); }
 
     host::HostCallbacks host;
-    sys_demuxer_st d;
+    sys_demuxer_st d{};
 };
