@@ -6,8 +6,10 @@
 #include <cstring>
 #include <sstream>
 #include <string>
+#include <vector>
 
 #include "asf_api.h"
+#include "raw_input.h"
 #include "loader.h"
 #include "test_env.h"
 
@@ -32,15 +34,6 @@ TEST(Descriptor, LoadsByNameAndFillsTheSlotsTheHostCalls) {
     EXPECT_EQ(loader.disable_log_getter()(), 0);
 }
 
-TEST(Descriptor, ContextSizeHoldsTheFixedRecordAndExactlyTwoStreams) {
-    const int size = hova_asff_demuxer.min_context_size;
-    EXPECT_EQ(size, static_cast<int>(sizeof(asf_demuxer_st) + 2 * sizeof(asf_stream_st)));
-    EXPECT_LT(size, static_cast<int>(sizeof(asf_demuxer_st) + 3 * sizeof(asf_stream_st)));
-    // The stream records follow the fixed record with nothing between.
-    EXPECT_EQ(offsetof(asf_demuxer_st, stream_info), sizeof(asf_demuxer_st));
-    EXPECT_EQ(sizeof(asf_demuxer_st) % alignof(asf_stream_st), 0u);
-}
-
 TEST(Descriptor, TrivialEntryPointsAnswerAsDocumented) {
     alignas(8) std::array<uint8_t, 4096> buf{};
     auto* ctx = reinterpret_cast<asf_demuxer_st*>(buf.data());
@@ -62,6 +55,43 @@ TEST(Descriptor, TrivialEntryPointsAnswerAsDocumented) {
         EXPECT_EQ(hova_asff_demuxer.set_multi_thumb(ctx, interval), HOVA_OK);
         EXPECT_EQ(ctx->s.thumbnail_interval, interval);
     }
+}
+
+const uint8_t kHeaderGuid[16] = {0x30, 0x26, 0xB2, 0x75, 0x8E, 0x66, 0xCF, 0x11,
+                                 0xA6, 0xD9, 0x00, 0xAA, 0x00, 0x62, 0xCE, 0x6C};
+
+// The header GUID at the start, or behind an ID3v2 tag (syncsafe size 259:
+// 269 bytes) on a seekable input that is put back at its start.
+TEST(Probe, RecognisesTheHeaderGuidAtTheStartOrBehindAnId3Tag) {
+    std::vector<uint8_t> at0(64, 0);
+    std::memcpy(at0.data(), kHeaderGuid, 16);
+    std::vector<uint8_t> tagged(269 + 64, 0);
+    std::memcpy(tagged.data(), "ID3\x03\x00\x00\x80\x80\x82\x83", 10);
+    std::memcpy(tagged.data() + 269, kHeaderGuid, 16);
+    auto edit = [](std::vector<uint8_t> v, size_t at, uint8_t x) { return v[at] ^= x, v; };
+    auto cut = [](std::vector<uint8_t> v, size_t n) { return v.resize(n), v; };
+    const struct {
+        std::vector<uint8_t> file;
+        int len, expected;
+        bool seekable = true, refuse_seek = false;
+    } cases[] = {
+        {at0, 64, 1},          {at0, 16, 1},           {at0, 15, 0},
+        {at0, 0, 0},           {edit(at0, 15, 1), 64, 0}, {edit(at0, 0, 0x45), 64, 0},
+        {tagged, 64, 1},       {tagged, 64, 0, false}, {tagged, 64, 0, true, true},
+        {edit(tagged, 269, 0xFF), 64, 0}, {cut(tagged, 269 + 15), 64, 0},
+    };
+    int row = 0;
+    for (const auto& c : cases) {
+        SCOPED_TRACE(row++);
+        host::InputOptions in;
+        in.seekable = c.seekable;
+        auto raw = host::RawInput::from_memory(c.file, in);
+        raw->faults().refuse_seek = c.refuse_seek;
+        EXPECT_EQ(asf_probe(c.file.data(), c.len, raw->io(), HOVA_PROBE_NORMAL), c.expected);
+        EXPECT_EQ(raw->position(), 0u);
+        EXPECT_TRUE(c.seekable || raw->counters().seeks == 0);
+    }
+    EXPECT_EQ(asf_probe(tagged.data(), 64, nullptr, HOVA_PROBE_NORMAL), 0) << "no raw input";
 }
 
 std::string nm_symbols(const std::string& flags) {
