@@ -43,10 +43,10 @@ TEST(Open, RefusesMalformedHeaders) {
         {"no file properties", asfb::build(no_fp), HOVA_OpenFailed},
         {"packet sizes differ", asfb::build(file_with({a1}, mismatch)), HOVA_OpenFailed},
         {"packet size 0", asfb::build(file_with({a1}, zero)), HOVA_OpenFailed},
-        {"GUID last byte", edited([](Bytes& b) { b[15] ^= 1; }), HOVA_OpenFailed},
+        {"GUID", edited([](Bytes& b) { b[15] ^= 1; }), HOVA_OpenFailed},
         {"reserved1", edited([](Bytes& b) { b[28] = 0; }), HOVA_OpenFailed},
         {"reserved2", edited([](Bytes& b) { b[29] = 3; }), HOVA_OpenFailed},
-        {"header size 30", edited([](Bytes& b) { b[16] = 30, b[17] = 0; }), HOVA_OpenFailed},
+        {"size 30", edited([](Bytes& b) { b[16] = 30, b[17] = 0; }), HOVA_OpenFailed},
         {"extension reserved 5",
          asfb::build(file_with({asfb::header_extension({}, {}, 5), a1})), HOVA_OpenFailed},
         {"ext content size 0",
@@ -152,8 +152,8 @@ TEST(Open, RichFileFillsEveryRecord) {
 }
 
 // Cut after each byte of the header and the data object's header: never
-// opens, never leaks; every allocation of open refused in turn: the same.
-TEST(Open, TruncationsAndRefusedAllocationsLeaveNothing) {
+// opens, never leaks. (Refused allocations: tests/faults.)
+TEST(Open, TruncatedAtEveryHeaderByteLeavesNothing) {
     const asfb::File f = rich_file();
     const Bytes whole = asfb::build(f);
     const size_t end = asfb::header_object(f.header_children).size() + 50;
@@ -166,18 +166,6 @@ TEST(Open, TruncationsAndRefusedAllocationsLeaveNothing) {
         }
         EXPECT_TRUE(o.close_clean()) << "cut at " << n;
     }
-    int refused = 0;
-    for (uint64_t n = 1;; ++n) {
-        auto s = host::Session::from_bytes(&dmx, whole);
-        s->callbacks().fail_malloc_at(n);
-        const int rc = s->open();
-        EXPECT_TRUE(rc == HOVA_OK || rc == HOVA_NotEnoughMemory) << n;
-        refused += rc == HOVA_NotEnoughMemory;
-        s->close();
-        EXPECT_EQ(s->blocks_outstanding(), 0u) << n;
-        if (s->callbacks().malloc_calls() < n) break;
-    }
-    EXPECT_GE(refused, 3) << "reader block and both configuration blocks are required";
 }
 
 // Size fields that break naive arithmetic, on every object the walk reads,
@@ -189,7 +177,6 @@ TEST(Open, HostileSizeFieldsNeverOpenOrLeak) {
     using S = std::optional<uint64_t>;
     asfb::StreamProps sp;
     sp.type_specific = asfb::waveformatex({});
-    const Bytes unknown(8, 0);
     const auto other = asfb::guid_from_text("01020304-0506-0708-090A-0B0C0D0E0F10");
     const std::function<Bytes(S)> objects[] = {
         [](S s) { return asfb::file_properties({}, s); },
@@ -200,26 +187,27 @@ TEST(Open, HostileSizeFieldsNeverOpenOrLeak) {
             return asfb::extended_content_description({{"WM/Year", 0, asfb::string_value("1")}},
                                                       s);
         },
-        [&](S s) { return asfb::object(other, unknown, s); },
+        [&](S s) { return asfb::object(other, Bytes(8, 0), s); },
         [](S s) { return ext({asfb::extended_stream_properties({}, s)}); },
         [](S s) { return ext({asfb::language_list({"en"}, s)}); },
-        [](S s) { return ext({asfb::metadata_library({{0, 0, "WM/Picture", 1, Bytes(10, 1)}}, s)}); },
+        [](S s) {
+            return ext({asfb::metadata_library({{0, 0, "WM/Picture", 1, Bytes(10, 1)}}, s)});
+        },
         [&](S s) { return ext({asfb::stream_properties(sp, s)}); },
     };
-    int i = 0;
     for (const auto& make : objects) {
-        ++i;
         const uint64_t real = make(std::nullopt).size();
         for (uint64_t size : sizes) {
             for (S hs : {S{}, S{~0ull}}) {
-                SCOPED_TRACE(testing::Message() << "object " << i << " size " << size << " " << !!hs);
+                SCOPED_TRACE(testing::Message() << "object of " << real << " bytes, size " << size
+                                                << (hs ? ", endless header" : ""));
                 Bytes bytes = asfb::header_object(
                     {asfb::file_properties({}), make(size), asfb::audio_stream(1)}, hs);
                 const Bytes data = asfb::data_object({asfb::filler_packet(3200)});
                 bytes.insert(bytes.end(), data.begin(), data.end());
                 Opened o = testsupport::open_bytes(bytes);
                 if (o.rc == HOVA_OK) {
-                    EXPECT_TRUE(size >= 24 && size <= real) << real;
+                    EXPECT_TRUE(size >= 24 && size <= real);
                 } else {
                     EXPECT_TRUE(o.rc == HOVA_OpenFailed || o.rc == HOVA_EndOfStream ||
                                 o.rc == HOVA_NotEnoughMemory) << o.rc;

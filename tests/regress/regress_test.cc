@@ -36,27 +36,22 @@ void play_everything(const Bytes& file) {
 // values: their difference in microseconds once overflowed a signed 64-bit
 // integer. The duration is now the wrapped difference, and open goes on.
 TEST(Regress, FilePropertiesDurationAndPrerollAtTheirExtremes) {
-    const struct {
-        uint64_t play_duration;
-        uint64_t preroll;
-    } cases[] = {
+    const std::pair<uint64_t, uint64_t> cases[] = {  // play duration, preroll
         {0xFFFFFFFFFFFFFFFFull, 0},                      // largest duration
         {0x16640000000000ull, 0xFFFFFFFFFFFFFFFFull},    // preroll * 1000 wraps
         {0, 0x7FFFFFFFFFFFFFFFull},
         {0xFFFFFFFFFFFFFFFFull, 0x8000000000000000ull},
     };
-    for (const auto& c : cases) {
-        SCOPED_TRACE(c.preroll);
+    for (const auto& [play_duration, preroll] : cases) {
+        SCOPED_TRACE(preroll);
         asfb::FileProps fp;
-        fp.play_duration = c.play_duration;
-        fp.preroll = c.preroll;
+        fp.play_duration = play_duration;
+        fp.preroll = preroll;
         fp.packet_count = 2;
         auto f = testsupport::file_with({asfb::audio_stream(1)}, fp);
         auto o = testsupport::open_file(f);
         ASSERT_EQ(o.rc, HOVA_OK);
-        const int64_t expected =
-            static_cast<int64_t>(c.play_duration / 10 - c.preroll * 1000);
-        EXPECT_EQ(o.ctx()->s.duration, expected);
+        EXPECT_EQ(o.ctx()->s.duration, static_cast<int64_t>(play_duration / 10 - preroll * 1000));
         EXPECT_TRUE(o.close_clean());
         play_everything(asfb::build(f));
     }
