@@ -52,11 +52,8 @@ struct Fault {
 struct Report {
     int open_rc = -1;
     std::vector<std::string> bad_results;   // "entry: code" for each result not allowed
-    size_t blocks_after_close = 0;
-    uint64_t foreign_frees = 0;
-    uint64_t protocol_errors = 0;
+    uint64_t blocks_after_close = 0, foreign_frees = 0, protocol_errors = 0;
     uint64_t mallocs = 0, allocs = 0, reallocs = 0, input_seeks = 0;
-    size_t frames = 0;
     bool clean() const {
         return bad_results.empty() && blocks_after_close == 0 && foreign_frees == 0 &&
                protocol_errors == 0;
@@ -151,7 +148,6 @@ private:
             // NotEnoughMemory: the host refused a configuration record.
             check(r, "get_data", rc,
                   {HOVA_OK, HOVA_TryAgain, HOVA_EndOfStream, HOVA_NotEnoughMemory});
-            if (rc == HOVA_OK) ++r.frames;
             if (rc == HOVA_EndOfStream) return;
         }
     }
