@@ -144,23 +144,6 @@ TEST(Open, RichFileFillsEveryRecord) {
     o.session.reset();
 }
 
-// Cut after each byte of the header and the data object's header: never
-// opens, never leaks. (Refused allocations: tests/faults.)
-TEST(Open, TruncatedAtEveryHeaderByteLeavesNothing) {
-    const asfb::File f = rich_file();
-    const Bytes whole = asfb::build(f);
-    const size_t end = asfb::header_object(f.header_children).size() + 50;
-    for (size_t n = 0; n <= end; ++n) {
-        Opened o = testsupport::open_bytes(Bytes(whole.begin(), whole.begin() + n));
-        if (n < end) {
-            EXPECT_TRUE(o.rc == HOVA_EndOfStream || o.rc == HOVA_OpenFailed) << n;
-        } else {
-            EXPECT_EQ(o.rc, HOVA_OK);
-        }
-        EXPECT_TRUE(o.close_clean()) << "cut at " << n;
-    }
-}
-
 // Size fields that break naive arithmetic, on every object the walk reads,
 // in a header of its own size and in an endless one: a size below the
 // object's header never opens, one above the real size never opens.

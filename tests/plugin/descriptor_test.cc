@@ -50,11 +50,6 @@ TEST(Descriptor, TrivialEntryPointsAnswerAsDocumented) {
     for (int ev = HOVA_NOTIFY_NONE; ev <= HOVA_NOTIFY_SVP_VERSION; ++ev)
         EXPECT_EQ(dmx.notify_event(ctx, static_cast<hova_player_notify_et>(ev), nullptr), HOVA_OK);
     EXPECT_EQ(buf, before) << "notify_event changes nothing";
-
-    for (int64_t interval : {int64_t{0}, int64_t{2000000}, int64_t{-1}, INT64_MAX}) {
-        EXPECT_EQ(dmx.set_multi_thumb(ctx, interval), HOVA_OK);
-        EXPECT_EQ(ctx->s.thumbnail_interval, interval);
-    }
 }
 
 const uint8_t kHeaderGuid[16] = {0x30, 0x26, 0xB2, 0x75, 0x8E, 0x66, 0xCF, 0x11,
