@@ -75,7 +75,7 @@ public:
 
     Report run() {
         current() = this;
-        Report r;
+        Report& r = report_;
         host::ContextBuffer buffer(static_cast<size_t>(hova_asff_demuxer.min_context_size));
         const hova_dmx_func_st& d = hova_asff_demuxer;
         host_.fail_malloc_at(fault_.fail_malloc);
@@ -110,8 +110,6 @@ public:
         r.foreign_frees = host_.foreign_frees();
         r.protocol_errors = host_.protocol_errors();
         r.mallocs = host_.malloc_calls();
-        r.allocs = allocs_;
-        r.reallocs = reallocs_;
         r.input_seeks = input_->counters().seeks;
         current() = nullptr;
         return r;
@@ -126,7 +124,7 @@ private:
     template <bool Realloc>
     static int shim(void* c, hova_stream_type_et t, void** buffer, int size) {
         SessionRun* s = current();
-        const uint64_t n = ++(Realloc ? s->reallocs_ : s->allocs_);
+        const uint64_t n = ++(Realloc ? s->report_.reallocs : s->report_.allocs);
         if (n == (Realloc ? s->fault_.refuse_realloc : s->fault_.refuse_alloc))
             return *buffer = nullptr, -1;
         const hova_callback_st* h = s->host_.table();
@@ -157,8 +155,7 @@ private:
     hova_callback_st table_{};
     std::unique_ptr<host::RawInput> input_;
     int ring_size_ = 0;
-    uint64_t allocs_ = 0;
-    uint64_t reallocs_ = 0;
+    Report report_;
 };
 
 inline Report run_session(const Bytes& file, Buffering b, const Fault& f = {}) {

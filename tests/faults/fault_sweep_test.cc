@@ -19,10 +19,7 @@
 
 namespace {
 
-using faults::Buffering;
-using faults::Bytes;
-using faults::Fault;
-using faults::Report;
+using namespace faults;
 
 constexpr Buffering kAllModes[] = {Buffering::Cache, Buffering::None, Buffering::Ring,
                                    Buffering::RingThread};
