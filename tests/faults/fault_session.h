@@ -55,8 +55,7 @@ struct Report {
     uint64_t blocks_after_close = 0, foreign_frees = 0, protocol_errors = 0;
     uint64_t mallocs = 0, allocs = 0, reallocs = 0, input_seeks = 0;
     bool clean() const {
-        return bad_results.empty() && blocks_after_close == 0 && foreign_frees == 0 &&
-               protocol_errors == 0;
+        return bad_results.empty() && !blocks_after_close && !foreign_frees && !protocol_errors;
     }
 };
 

@@ -14,6 +14,8 @@
 #include "raw_input.h"
 #include "test_env.h"
 
+#pragma GCC diagnostic ignored "-Wmissing-field-initializers"
+
 namespace {
 
 const hova_dmx_func_st& dmx = hova_asff_demuxer;
@@ -74,12 +76,9 @@ TEST(Probe, RecognisesTheHeaderGuidAtTheStartOrBehindAnId3Tag) {
         {tagged, 64, 1},       {tagged, 64, 0, false}, {tagged, 64, 0, true, true},
         {edit(tagged, 269, 0xFF), 64, 0}, {cut(tagged, 269 + 15), 64, 0},
     };
-    int row = 0;
     for (const auto& c : cases) {
-        SCOPED_TRACE(row++);
-        host::InputOptions in;
-        in.seekable = c.seekable;
-        auto raw = host::RawInput::from_memory(c.file, in);
+        SCOPED_TRACE(&c - cases);
+        auto raw = host::RawInput::from_memory(c.file, {.seekable = c.seekable});
         raw->faults().refuse_seek = c.refuse_seek;
         EXPECT_EQ(asf_probe(c.file.data(), c.len, raw->io(), HOVA_PROBE_NORMAL), c.expected);
         EXPECT_EQ(raw->position(), 0u);
