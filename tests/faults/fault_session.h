@@ -8,8 +8,10 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cstdint>
 #include <memory>
+#include <sstream>
 #include <string>
 #include <vector>
 
@@ -26,18 +28,14 @@ using Bytes = std::vector<uint8_t>;
 enum class Buffering { Cache, None, Ring, RingThread };
 
 inline const char* name_of(Buffering b) {
-    switch (b) {
-        case Buffering::Cache: return "cache";
-        case Buffering::None: return "none";
-        case Buffering::Ring: return "ring";
-        default: return "ring+thread";
-    }
+    static const char* const names[] = {"cache", "none", "ring", "ring+thread"};
+    return names[static_cast<int>(b)];
 }
 
 inline host::InputOptions input_for(Buffering b) {
     host::InputOptions in;
     in.disable_cache = b == Buffering::None;
-    in.rbuf_mode = (b == Buffering::Ring || b == Buffering::RingThread) ? CBIO_APPLY_RBUF : CBIO_NO_RBUF;
+    in.rbuf_mode = b >= Buffering::Ring ? CBIO_APPLY_RBUF : CBIO_NO_RBUF;
     in.use_thread = b == Buffering::RingThread;
     in.ring_size = 65536;
     return in;
@@ -54,14 +52,10 @@ struct Fault {
 struct Report {
     int open_rc = -1;
     std::vector<std::string> bad_results;   // "entry: code" for each result not allowed
-    size_t blocks_after_close = 0;
-    uint64_t foreign_frees = 0;
-    uint64_t protocol_errors = 0;
+    uint64_t blocks_after_close = 0, foreign_frees = 0, protocol_errors = 0;
     uint64_t mallocs = 0, allocs = 0, reallocs = 0, input_seeks = 0;
-    size_t frames = 0;
     bool clean() const {
-        return bad_results.empty() && blocks_after_close == 0 && foreign_frees == 0 &&
-               protocol_errors == 0;
+        return bad_results.empty() && !blocks_after_close && !foreign_frees && !protocol_errors;
     }
 };
 
@@ -73,36 +67,40 @@ public:
         input_->faults().end_after = f.end_after;
         input_->faults().fail_seeks_after = f.fail_seeks_after;
         table_ = *host_.table();
-        table_.stream_alloc = &shim_alloc;
-        table_.stream_realloc = &shim_realloc;
+        table_.stream_alloc = &shim<false>;
+        table_.stream_realloc = &shim<true>;
         ring_size_ = in.ring_size;
     }
 
     Report run() {
         current() = this;
-        Report r;
+        Report& r = report_;
         host::ContextBuffer buffer(static_cast<size_t>(hova_asff_demuxer.min_context_size));
         const hova_dmx_func_st& d = hova_asff_demuxer;
         host_.fail_malloc_at(fault_.fail_malloc);
         void* ctx = nullptr;
-        r.open_rc = d.open_file(&ctx, input_->io(), buffer.data(), buffer.size(), ring_size_, &table_);
-        check(r, "open_file", r.open_rc, {HOVA_OK, HOVA_NotEnoughMemory, HOVA_OpenFailed, HOVA_EndOfStream});
+        r.open_rc =
+            d.open_file(&ctx, input_->io(), buffer.data(), buffer.size(), ring_size_, &table_);
+        check(r, "open_file", r.open_rc,
+              {HOVA_OK, HOVA_NotEnoughMemory, HOVA_OpenFailed, HOVA_EndOfStream});
         if (r.open_rc == HOVA_OK) {
+            const std::initializer_list<int> info_rc = {HOVA_OK, HOVA_InvalidParam};
+            const std::initializer_list<int> seek_rc = {HOVA_OK, HOVA_SeekFailed};
             hova_clip_info_st clip{};
             hova_program_info_st prog{};
             hova_audio_info_st audio{};
             hova_video_info_st video{};
             check(r, "get_info", d.get_info(ctx, HOVA_STREAM_NONE, 0, &clip), {HOVA_OK});
             check(r, "get_info", d.get_info(ctx, HOVA_STREAM_PROG, 0, &prog), {HOVA_OK});
-            check(r, "get_info", d.get_info(ctx, HOVA_STREAM_AUDIO, 0, &audio), {HOVA_OK, HOVA_InvalidParam});
-            check(r, "get_info", d.get_info(ctx, HOVA_STREAM_VIDEO, 0, &video), {HOVA_OK, HOVA_InvalidParam});
+            check(r, "get_info", d.get_info(ctx, HOVA_STREAM_AUDIO, 0, &audio), info_rc);
+            check(r, "get_info", d.get_info(ctx, HOVA_STREAM_VIDEO, 0, &video), info_rc);
             const int64_t duration = prog.duration > 0 ? prog.duration : 4000000;
             deliver(r, ctx, 30);
             int64_t pts = duration / 2;
-            check(r, "seek_time", d.seek_time(ctx, HOVA_SEEK_FORWARD, &pts, 0), {HOVA_OK, HOVA_SeekFailed});
+            check(r, "seek_time", d.seek_time(ctx, HOVA_SEEK_FORWARD, &pts, 0), seek_rc);
             deliver(r, ctx, 30);
             pts = duration / 4;
-            check(r, "seek_time", d.seek_time(ctx, HOVA_SEEK_BACKWARD, &pts, 0), {HOVA_OK, HOVA_SeekFailed});
+            check(r, "seek_time", d.seek_time(ctx, HOVA_SEEK_BACKWARD, &pts, 0), seek_rc);
             check(r, "resync_time", d.resync_time(ctx, 0), {HOVA_OK});
             deliver(r, ctx, 20000);
             check(r, "close_file", d.close_file(ctx), {HOVA_OK});
@@ -111,8 +109,6 @@ public:
         r.foreign_frees = host_.foreign_frees();
         r.protocol_errors = host_.protocol_errors();
         r.mallocs = host_.malloc_calls();
-        r.allocs = allocs_;
-        r.reallocs = reallocs_;
         r.input_seeks = input_->counters().seeks;
         current() = nullptr;
         return r;
@@ -123,27 +119,20 @@ private:
         static SessionRun* run = nullptr;
         return run;
     }
-    static int shim_alloc(void* c, hova_stream_type_et t, void** buffer, int size) {
+    // stream_alloc (Realloc false) or stream_realloc, refused at its armed call.
+    template <bool Realloc>
+    static int shim(void* c, hova_stream_type_et t, void** buffer, int size) {
         SessionRun* s = current();
-        if (++s->allocs_ == s->fault_.refuse_alloc) {
-            *buffer = nullptr;
-            return -1;
-        }
-        return s->host_.table()->stream_alloc(c, t, buffer, size);
-    }
-    static int shim_realloc(void* c, hova_stream_type_et t, void** buffer, int size) {
-        SessionRun* s = current();
-        if (++s->reallocs_ == s->fault_.refuse_realloc) {
-            *buffer = nullptr;
-            return -1;
-        }
-        return s->host_.table()->stream_realloc(c, t, buffer, size);
+        const uint64_t n = ++(Realloc ? s->report_.reallocs : s->report_.allocs);
+        if (n == (Realloc ? s->fault_.refuse_realloc : s->fault_.refuse_alloc))
+            return *buffer = nullptr, -1;
+        const hova_callback_st* h = s->host_.table();
+        return (Realloc ? h->stream_realloc : h->stream_alloc)(c, t, buffer, size);
     }
 
     static void check(Report& r, const char* entry, int rc, std::initializer_list<int> allowed) {
-        for (int a : allowed)
-            if (rc == a) return;
-        r.bad_results.push_back(std::string(entry) + ": " + std::to_string(rc));
+        if (std::find(allowed.begin(), allowed.end(), rc) == allowed.end())
+            r.bad_results.push_back(std::string(entry) + ": " + std::to_string(rc));
     }
 
     void deliver(Report& r, void* ctx, int limit) {
@@ -154,8 +143,8 @@ private:
             int64_t pts = 0;
             const int rc = hova_asff_demuxer.get_data(ctx, &type, &size, &pts);
             // NotEnoughMemory: the host refused a configuration record.
-            check(r, "get_data", rc, {HOVA_OK, HOVA_TryAgain, HOVA_EndOfStream, HOVA_NotEnoughMemory});
-            if (rc == HOVA_OK) ++r.frames;
+            check(r, "get_data", rc,
+                  {HOVA_OK, HOVA_TryAgain, HOVA_EndOfStream, HOVA_NotEnoughMemory});
             if (rc == HOVA_EndOfStream) return;
         }
     }
@@ -165,8 +154,7 @@ private:
     hova_callback_st table_{};
     std::unique_ptr<host::RawInput> input_;
     int ring_size_ = 0;
-    uint64_t allocs_ = 0;
-    uint64_t reallocs_ = 0;
+    Report report_;
 };
 
 inline Report run_session(const Bytes& file, Buffering b, const Fault& f = {}) {
@@ -176,12 +164,11 @@ inline Report run_session(const Bytes& file, Buffering b, const Fault& f = {}) {
 
 // One line for a failed expectation.
 inline std::string describe(const Report& r) {
-    std::string s = "open " + std::to_string(r.open_rc) + ", blocks after close " +
-                    std::to_string(r.blocks_after_close) + ", protocol errors " +
-                    std::to_string(r.protocol_errors) + ", foreign frees " +
-                    std::to_string(r.foreign_frees);
-    for (const auto& b : r.bad_results) s += "; " + b;
-    return s;
+    std::ostringstream s;
+    s << "open " << r.open_rc << ", blocks after close " << r.blocks_after_close
+      << ", protocol errors " << r.protocol_errors << ", foreign frees " << r.foreign_frees;
+    for (const auto& b : r.bad_results) s << "; " << b;
+    return s.str();
 }
 
 }  // namespace faults

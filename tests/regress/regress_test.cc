@@ -23,42 +23,34 @@ namespace {
 using asfb::Bytes;
 namespace fs = std::filesystem;
 
-// Plays a built file through every host action the seek target knows, so
-// that a finding in any entry point shows here under the test build's
-// sanitizers.
-void play_everything(const Bytes& file) {
-    const plugfuzz::Op ops[] = {{0, 20}, {2, 8},  {0x0a, 200}, {0, 10}, {3, 4},
-                                {0, 10}, {4, 1},  {0, 10},     {5, 3},  {7, 0}};
-    plugfuzz::run(file.data(), file.size(), plugfuzz::Mode{}, ops, std::size(ops));
-}
-
 // The file properties' play duration and preroll are both untrusted 64-bit
 // values: their difference in microseconds once overflowed a signed 64-bit
 // integer. The duration is now the wrapped difference, and open goes on.
 TEST(Regress, FilePropertiesDurationAndPrerollAtTheirExtremes) {
-    const struct {
-        uint64_t play_duration;
-        uint64_t preroll;
-    } cases[] = {
+    const std::pair<uint64_t, uint64_t> cases[] = {  // play duration, preroll
         {0xFFFFFFFFFFFFFFFFull, 0},                      // largest duration
+        {50000000, (1ull << 32) + 1000},                 // preroll above 32 bits
         {0x16640000000000ull, 0xFFFFFFFFFFFFFFFFull},    // preroll * 1000 wraps
         {0, 0x7FFFFFFFFFFFFFFFull},
         {0xFFFFFFFFFFFFFFFFull, 0x8000000000000000ull},
     };
-    for (const auto& c : cases) {
-        SCOPED_TRACE(c.preroll);
+    for (const auto& [play_duration, preroll] : cases) {
+        SCOPED_TRACE(preroll);
         asfb::FileProps fp;
-        fp.play_duration = c.play_duration;
-        fp.preroll = c.preroll;
+        fp.play_duration = play_duration;
+        fp.preroll = preroll;
         fp.packet_count = 2;
         auto f = testsupport::file_with({asfb::audio_stream(1)}, fp);
         auto o = testsupport::open_file(f);
         ASSERT_EQ(o.rc, HOVA_OK);
-        const int64_t expected =
-            static_cast<int64_t>(c.play_duration / 10 - c.preroll * 1000);
-        EXPECT_EQ(o.ctx()->s.duration, expected);
+        EXPECT_EQ(o.ctx()->s.duration, static_cast<int64_t>(play_duration / 10 - preroll * 1000));
         EXPECT_TRUE(o.close_clean());
-        play_everything(asfb::build(f));
+        // Every host action the seek target knows, so that a finding in any
+        // entry point shows here under the test build's sanitizers.
+        const plugfuzz::Op ops[] = {{0, 20}, {2, 8}, {0x0a, 200}, {0, 10}, {3, 4},
+                                    {0, 10}, {4, 1}, {0, 10},     {5, 3},  {7, 0}};
+        const Bytes file = asfb::build(f);
+        plugfuzz::run(file.data(), file.size(), plugfuzz::Mode{}, ops, std::size(ops));
     }
 }
 
