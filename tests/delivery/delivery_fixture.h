@@ -75,7 +75,9 @@ public:
         EXPECT_EQ(host.outstanding_blocks(), 0u);
         EXPECT_EQ(host.protocol_errors(), 0u);
     }
-    size_t count(int result) const { return size_t(std::count(results.begin(), results.end(), result)); }
+    size_t count(int result) const {
+        return size_t(std::count(results.begin(), results.end(), result));
+    }
     asf_demuxer_st* ctx() { return static_cast<asf_demuxer_st*>(ctx_); }
     host::RawInput& input() { return *input_; }
     std::vector<host::HostEvent> frames(hova_stream_type_et t) const { return host.commits(t, 0); }
@@ -151,7 +153,8 @@ inline void expect_frames(const Player& pl, const std::vector<Want>& want) {
         ASSERT_EQ(got.size(), own.size()) << "stream " << int(s);
         for (size_t i = 0; i < got.size(); ++i) {
             EXPECT_EQ(got[i].pts, own[i]->pts) << "stream " << int(s) << " frame " << i;
-            EXPECT_EQ(got[i].size, int(own[i]->data.size())) << "stream " << int(s) << " frame " << i;
+            EXPECT_EQ(got[i].size, int(own[i]->data.size()))
+                << "stream " << int(s) << " frame " << i;
             EXPECT_EQ(got[i].crc32, crc(own[i]->data)) << "stream " << int(s) << " frame " << i;
         }
     }

@@ -12,7 +12,9 @@ using asfb::pattern;
 using asfb::Object;
 
 Bytes one(const asfb::Payload& p, uint32_t size) { return asfb::packet({p}, size); }
-Bytes cut(const Bytes& b, size_t from, size_t to) { return Bytes(b.begin() + from, b.begin() + to); }
+Bytes cut(const Bytes& b, size_t from, size_t to) {
+    return Bytes(b.begin() + from, b.begin() + to);
+}
 Bytes cat(std::initializer_list<Bytes> parts) {
     Bytes out;
     for (const Bytes& p : parts) out.insert(out.end(), p.begin(), p.end());
@@ -73,13 +75,15 @@ std::vector<Shape> shapes() {
         const Bytes o = pattern(300, 1);
         const auto first = t.rep >= 8 ? media(1, 1, 0, 300, t.ms, o, false, t.rep - 8)
                                       : asfb::untimed(1, 1, 0, o, t.rep);
-        s.push_back({"time " + std::to_string(t.want),
-                     pfile({asfb::packet({first, media(1, 2, 0, 10, t.ms + 50, pattern(10, 2))}, 1024)},
-                           1024, [&](asfb::PacketFile& f) {
-                               f.preroll_ms = t.preroll;
-                               f.audio_time_offset = t.offset;
-                           }),
-                     {{1, t.want, o}}});
+        s.push_back(
+            {"time " + std::to_string(t.want),
+             pfile({asfb::packet({first, media(1, 2, 0, 10, t.ms + 50, pattern(10, 2))}, 1024)},
+                   1024,
+                   [&](asfb::PacketFile& f) {
+                       f.preroll_ms = t.preroll;
+                       f.audio_time_offset = t.offset;
+                   }),
+             {{1, t.want, o}}});
     }
     const Bytes v5 = pattern(200, 5);
     s.push_back({"video joined in an object's middle",
@@ -113,7 +117,8 @@ std::vector<Shape> shapes() {
         std::vector<Want> want;
         for (uint32_t i = 0; i < 6; ++i) {
             const auto p = media(1, i + 1, 0, 100, i * 10, pattern(100, i));
-            packets.push_back(i == 2 ? asfb::damaged_packet(how, {p}, 512) : asfb::packet({p}, 512));
+            packets.push_back(i == 2 ? asfb::damaged_packet(how, {p}, 512)
+                                     : asfb::packet({p}, 512));
             if (i != 2 && i != 5) want.push_back({1, i * 10000, p.data});
         }
         s.push_back({"damaged packet " + std::to_string(int(how)), av_file(packets, 512), want, 1});
@@ -147,12 +152,17 @@ std::vector<Shape> shapes() {
                           asfb::misaligned_packet(junk, {media(2, 1, 500, 900, 0, cut(v1, 500, 900),
                                                                true)}, 1024), tail}),
                  {{2, 0, v1}, {2, 40000, v2}}});
-    s.push_back({"misplaced packet holds an object",
-                 av_file({one(media(1, 1, 0, 10, 0, pattern(10, 9)), 1024),
-                          asfb::misaligned_packet(junk, {media(2, 1, 0, 900, 0, cut(v1, 0, 450), true),
-                                                         media(2, 1, 450, 900, 0, cut(v1, 450, 900),
-                                                               true)}, 1024), tail}),
-                 {{2, 0, v1}, {2, 40000, v2}}, 0, 1});
+    s.push_back(
+        {"misplaced packet holds an object",
+         av_file({one(media(1, 1, 0, 10, 0, pattern(10, 9)), 1024),
+                  asfb::misaligned_packet(junk,
+                                          {media(2, 1, 0, 900, 0, cut(v1, 0, 450), true),
+                                           media(2, 1, 450, 900, 0, cut(v1, 450, 900), true)},
+                                          1024),
+                  tail}),
+         {{2, 0, v1}, {2, 40000, v2}},
+         0,
+         1});
     Bytes zeros(1024, 0);
     zeros[0] = 0x91;  // error correction in an unusual form; nothing plausible after it
     s.push_back({"packet without a plausible start",
@@ -171,7 +181,8 @@ std::vector<Shape> shapes() {
         s.push_back({"uncounted", pfile(asfb::mux(*u.o, 1024), 1024, [&](asfb::PacketFile& f) {
                          f.packet_count = 0, f.broadcast = u.bc, f.data_object_size = u.size;
                      }), all_but_last(*u.o)});
-    s.push_back({"no packets", pfile({}, 1024, [](asfb::PacketFile& f) { f.packet_count = 0; }), {}});
+    s.push_back(
+        {"no packets", pfile({}, 1024, [](asfb::PacketFile& f) { f.packet_count = 0; }), {}});
     // Spread audio written back column by column.
     const struct { uint8_t span; uint16_t plen, clen; Bytes got, want; } spread[] = {
         {2, 4, 2, chunks({0, 1, 2, 3}), chunks({0, 2, 1, 3})},

@@ -100,12 +100,16 @@ TEST(EndOfData, ScansForANewHeaderWhenTheInputAsksForIt) {
 }
 
 TEST(Track, OnlySwitchingOffIsAccepted) {
-    const struct { hova_stream_type_et type; int index, result, off; } rows[] = {
-        {HOVA_STREAM_PROG, 0, HOVA_OK, -1},         {HOVA_STREAM_PROG, 1, HOVA_InvalidParam, -1},
-        {HOVA_STREAM_AUDIO, 0, HOVA_InvalidParam, -1}, {HOVA_STREAM_VIDEO, 1, HOVA_InvalidParam, -1},
-        {HOVA_STREAM_AUDIO, -1, HOVA_OK, AUD},      {HOVA_STREAM_VIDEO, -1, HOVA_OK, VID},
-        {HOVA_STREAM_SUBTITLE, -1, HOVA_OK, SUB},   {HOVA_STREAM_NONE, -1, HOVA_InvalidParam, -1},
-        {HOVA_STREAM_CLIP, -1, HOVA_InvalidParam, -1}};
+    const struct { hova_stream_type_et type; int index, result, off;
+    } rows[] = {{HOVA_STREAM_PROG, 0, HOVA_OK, -1},
+                {HOVA_STREAM_PROG, 1, HOVA_InvalidParam, -1},
+                {HOVA_STREAM_AUDIO, 0, HOVA_InvalidParam, -1},
+                {HOVA_STREAM_VIDEO, 1, HOVA_InvalidParam, -1},
+                {HOVA_STREAM_AUDIO, -1, HOVA_OK, AUD},
+                {HOVA_STREAM_VIDEO, -1, HOVA_OK, VID},
+                {HOVA_STREAM_SUBTITLE, -1, HOVA_OK, SUB},
+                {HOVA_STREAM_NONE, -1, HOVA_InvalidParam, -1},
+                {HOVA_STREAM_CLIP, -1, HOVA_InvalidParam, -1}};
     for (const auto& r : rows) {
         SCOPED_TRACE(testing::Message() << r.type << " " << r.index);
         Player pl(av_file(asfb::mux(skewed(2, 0, 0), 1024)));
@@ -114,8 +118,9 @@ TEST(Track, OnlySwitchingOffIsAccepted) {
         active[SUB] = 5;  // a subtitle track pretended active
         const int before[3] = {active[0], active[1], active[2]};
         for (int twice = 0; twice < 2; ++twice)
-            EXPECT_EQ(hova_asff_demuxer.set_track(pl.ctx(), r.type, r.index, 123, HOVA_INPUT_MASTER),
-                      r.result);
+            EXPECT_EQ(
+                hova_asff_demuxer.set_track(pl.ctx(), r.type, r.index, 123, HOVA_INPUT_MASTER),
+                r.result);
         for (int k = 0; k < 3; ++k) EXPECT_EQ(active[k], k == r.off ? -1 : before[k]) << k;
         active[SUB] = -1;
         pl.expect_clean_close();
@@ -141,7 +146,8 @@ TEST(Track, AStreamSwitchedOffLeavesTheOtherWhole) {
             if (at) {
                 ASSERT_EQ(pl.ctx()->parse_mode, PARSE_SEP);
             }
-            ASSERT_EQ(hova_asff_demuxer.set_track(pl.ctx(), off, -1, 0, HOVA_INPUT_MASTER), HOVA_OK);
+            ASSERT_EQ(hova_asff_demuxer.set_track(pl.ctx(), off, -1, 0, HOVA_INPUT_MASTER),
+                      HOVA_OK);
             auto& ev = pl.host.events();
             ev.erase(std::remove_if(ev.begin(), ev.end(), [&](auto& e) { return e.type == off; }),
                      ev.end());
@@ -206,7 +212,8 @@ TEST(Refusal, AConfigurationIsRetriedAndRefusedFrameMemoryCostsObjectsOnly) {
         pl.host.refuse_stream_realloc = realloc;
         ASSERT_EQ(pl.play(), HOVA_EndOfStream);
         EXPECT_EQ(pl.count(HOVA_OK), 38u);  // every completed object still ends a call
-        const size_t a = pl.frames(HOVA_STREAM_AUDIO).size(), v = pl.frames(HOVA_STREAM_VIDEO).size();
+        const size_t a = pl.frames(HOVA_STREAM_AUDIO).size(),
+                     v = pl.frames(HOVA_STREAM_VIDEO).size();
         EXPECT_TRUE(realloc ? a > 10 && v <= v0 + 1 : a + v <= before + 2) << a << " " << v;
         pl.expect_clean_close();
     }
@@ -316,20 +323,24 @@ TEST(AsfdumpFrames, PrintsEveryHostEventAndHonoursItsOptions) {
     for (const auto& w : all_but_last(objs, 500)) {
         char crc_hex[9];
         snprintf(crc_hex, sizeof crc_hex, "%08x", crc(w.data));
-        lines.push_back(std::string(R"("event":"frame","type":")") + (w.stream == 1 ? "audio" : "video") +
-                        R"(","pts":)" + std::to_string(w.pts) + R"(,"size":)" +
-                        std::to_string(w.data.size()) + R"(,"crc32":")" + crc_hex + "\"}");
+        lines.push_back(std::string(R"("event":"frame","type":")") +
+                        (w.stream == 1 ? "audio" : "video") + R"(","pts":)" +
+                        std::to_string(w.pts) + R"(,"size":)" + std::to_string(w.data.size()) +
+                        R"(,"crc32":")" + crc_hex + "\"}");
     }
     std::vector<std::string> got;
-    for (size_t i = 2; i < 12; ++i) got.push_back(d[i].dump().substr(d[i].dump().find(",\"event") + 1));
+    for (size_t i = 2; i < 12; ++i)
+        got.push_back(d[i].dump().substr(d[i].dump().find(",\"event") + 1));
     std::sort(got.begin(), got.end()), std::sort(lines.begin(), lines.end());
     EXPECT_EQ(got, lines);
     EXPECT_EQ(d[12]["event"], "eos");
     EXPECT_EQ(d[12]["type"], "audio");
     EXPECT_EQ(d[13]["type"], "video");
     EXPECT_EQ(d[14].dump(), R"({"event":"end","result":)" + std::to_string(HOVA_EndOfStream) +
-                                R"(,"calls":)" + d[12]["call"].dump() + R"(,"blocks_outstanding":0})");
-    auto count = [](const std::vector<nlohmann::ordered_json>& l, const char* ev, const char* type) {
+                                R"(,"calls":)" + d[12]["call"].dump() +
+                                R"(,"blocks_outstanding":0})");
+    auto count = [](const std::vector<nlohmann::ordered_json>& l, const char* ev,
+                    const char* type) {
         return std::count_if(l.begin(), l.end(), [&](const auto& j) {
             return j["event"] == ev && (!type || j["type"] == type);
         });
