@@ -109,30 +109,18 @@ TEST(IndexSeek, IndexThatCannotAnswerLeavesTheSeekToTheSearch) {
         Clip clip;
         bool index_answers;
     };
-    std::vector<Case> cases;
-    {
-        Clip c;  // entries past the data
-        c.index_entries = std::vector<uint32_t>(10, 5000);
-        cases.push_back({"past the data", c, false});
-    }
-    {
-        Clip c;  // more entries declared than the file holds
-        c.index_declared_count = 1000;
-        c.cut_after_entries = 2;
-        cases.push_back({"beyond the end of the file", c, false});
-    }
-    {
-        Clip c;
-        c.index_interval_100ns = 0;
-        cases.push_back({"interval 0", c, false});
-    }
-    {
-        // Every entry names packet 30: the index answers backward with it;
-        // forward its key frame lies before the target.
-        Clip c;
-        c.index_entries = std::vector<uint32_t>(10, 30);
-        cases.push_back({"all one packet", c, true});
-    }
+    std::vector<Case> cases(4, Case{"", Clip{}, false});
+    cases[0].what = "past the data";
+    cases[0].clip.index_entries = std::vector<uint32_t>(10, 5000);
+    cases[1].what = "more entries declared than the file holds";
+    cases[1].clip.index_declared_count = 1000;
+    cases[1].clip.cut_after_entries = 2;
+    cases[2].what = "interval 0";
+    cases[2].clip.index_interval_100ns = 0;
+    // Every entry names packet 30: backward answers with it; forward's key
+    // frame lies before the target.
+    cases[3] = {"all one packet", Clip{}, true};
+    cases[3].clip.index_entries = std::vector<uint32_t>(10, 30);
     for (const Case& k : cases) {
         for (int dir : {HOVA_SEEK_BACKWARD, HOVA_SEEK_FORWARD}) {
             SCOPED_TRACE(testing::Message() << k.what << ", dir " << dir);
