@@ -5,6 +5,7 @@
 #include <gtest/gtest.h>
 #include <zlib.h>
 
+#include <algorithm>
 #include <memory>
 #include <vector>
 
@@ -19,7 +20,6 @@ namespace delivery {
 
 using asfb::Bytes;
 using host::EventKind;
-using host::HostEvent;
 
 class Player {
 public:
@@ -36,7 +36,6 @@ public:
         close();
         if (current() == this) current() = nullptr;
     }
-
     // The Nth stream_alloc from now on is refused (0: none).
     void refuse_alloc_at(uint64_t n) { refuse_at_ = n ? alloc_calls + n : 0; }
     uint64_t alloc_calls = 0;
@@ -48,19 +47,16 @@ public:
         return rc;
     }
     void open_or_fail() { ASSERT_EQ(open(), HOVA_OK); }
-
-    // One get_data call; `type` as the plug-in left it (NONE when untouched).
+    // One get_data call; `last_type` as the plug-in left it (NONE when untouched).
     int step() {
         host.call++;
         last_type = HOVA_STREAM_NONE;
         int bufsize = -7;
         int64_t pts = -7;
-        const int rc = hova_asff_demuxer.get_data(ctx_, &last_type, &bufsize, &pts);
-        results.push_back(rc);
-        return rc;
+        results.push_back(hova_asff_demuxer.get_data(ctx_, &last_type, &bufsize, &pts));
+        return results.back();
     }
-    // Calls get_data until it reports the end (or something other than OK or
-    // TryAgain); returns that last result.
+    // Calls get_data until it reports something other than OK or TryAgain.
     int play(size_t max_calls = 100000) {
         for (size_t i = 0; i < max_calls; ++i) {
             const int rc = step();
@@ -77,20 +73,18 @@ public:
     void expect_clean_close() {
         EXPECT_EQ(close(), HOVA_OK);
         EXPECT_EQ(host.outstanding_blocks(), 0u);
-        EXPECT_EQ(host.protocol_errors(), 0u) << (host.protocol_error_log().empty()
-                                                      ? ""
-                                                      : host.protocol_error_log().front());
+        EXPECT_EQ(host.protocol_errors(), 0u);
     }
-
+    size_t count(int result) const {
+        return size_t(std::count(results.begin(), results.end(), result));
+    }
     asf_demuxer_st* ctx() { return static_cast<asf_demuxer_st*>(ctx_); }
     host::RawInput& input() { return *input_; }
-    std::vector<HostEvent> frames(hova_stream_type_et type) const { return host.commits(type, 0); }
-    std::vector<HostEvent> configs(hova_stream_type_et type) const { return host.commits(type, 1); }
-    std::vector<HostEvent> of_kind(EventKind k) const {
-        std::vector<HostEvent> out;
-        for (const HostEvent& e : const_cast<host::HostCallbacks&>(host).events())
-            if (e.kind == k) out.push_back(e);
-        return out;
+    std::vector<host::HostEvent> frames(hova_stream_type_et t) const { return host.commits(t, 0); }
+    std::vector<host::HostEvent> configs(hova_stream_type_et t) const { return host.commits(t, 1); }
+    size_t of_kind(EventKind k) {
+        return size_t(std::count_if(host.events().begin(), host.events().end(),
+                                    [k](const host::HostEvent& e) { return e.kind == k; }));
     }
 
     host::HostCallbacks host;
@@ -110,7 +104,6 @@ private:
         }
         return self->host_alloc_(ctx, type, buffer, size);
     }
-
     hova_callback_st table_{};
     int (*host_alloc_)(void*, hova_stream_type_et, void**, int) = nullptr;
     uint64_t refuse_at_ = 0;
@@ -131,12 +124,40 @@ inline Bytes av_file(std::vector<Bytes> packets, uint32_t packet_size = 1024,
     return asfb::build_packet_file(f);
 }
 
-inline uint32_t crc(const Bytes& b) { return static_cast<uint32_t>(crc32_z(0, b.data(), b.size())); }
+inline uint32_t crc(const Bytes& b) { return uint32_t(crc32_z(0, b.data(), b.size())); }
 
-inline Bytes concat(std::initializer_list<Bytes> parts) {
-    Bytes out;
-    for (const Bytes& p : parts) out.insert(out.end(), p.begin(), p.end());
+// A frame the host must receive: stream 1 audio, 2 video; time in microseconds.
+struct Want {
+    uint8_t stream;
+    int64_t pts;
+    Bytes data;
+};
+// Each stream's objects but its last (which stays pending at the end), shifted by `ms`.
+inline std::vector<Want> all_but_last(const std::vector<asfb::Object>& objs, int64_t ms = 0) {
+    std::vector<Want> out;
+    for (uint8_t s : {1, 2}) {
+        std::vector<Want> own;
+        for (const auto& o : objs)
+            if (o.stream == s) own.push_back({s, (int64_t(o.pts_ms) - ms) * 1000, o.data});
+        if (!own.empty()) out.insert(out.end(), own.begin(), own.end() - 1);
+    }
     return out;
+}
+// The frames of each stream are exactly `want`'s, in order.
+inline void expect_frames(const Player& pl, const std::vector<Want>& want) {
+    for (uint8_t s : {1, 2}) {
+        std::vector<const Want*> own;
+        for (const Want& w : want)
+            if (w.stream == s) own.push_back(&w);
+        const auto got = pl.frames(s == 1 ? HOVA_STREAM_AUDIO : HOVA_STREAM_VIDEO);
+        ASSERT_EQ(got.size(), own.size()) << "stream " << int(s);
+        for (size_t i = 0; i < got.size(); ++i) {
+            EXPECT_EQ(got[i].pts, own[i]->pts) << "stream " << int(s) << " frame " << i;
+            EXPECT_EQ(got[i].size, int(own[i]->data.size()))
+                << "stream " << int(s) << " frame " << i;
+            EXPECT_EQ(got[i].crc32, crc(own[i]->data)) << "stream " << int(s) << " frame " << i;
+        }
+    }
 }
 
 }  // namespace delivery

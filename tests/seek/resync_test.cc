@@ -30,8 +30,9 @@ TEST(Resync, FlushOnlyForMinusOneOtherwiseRestartAtTheInputsPosition) {
         for (bool thread : {false, true}) {
             // A threaded input is moved only through its own time seek.
             if (thread && !c.host_seek_time) continue;
-            SCOPED_TRACE(testing::Message() << "time " << c.time << (c.host_seek_time ? "" : ", no seek_time")
-                                            << (thread ? ", streaming thread" : ", cache"));
+            SCOPED_TRACE(testing::Message()
+                         << "time " << c.time << (c.host_seek_time ? "" : ", no seek_time")
+                         << (thread ? ", streaming thread" : ", cache"));
             Clip clip;
             clip.index = false;  // the input ends with the data
             host::InputOptions in;
@@ -53,7 +54,8 @@ TEST(Resync, FlushOnlyForMinusOneOtherwiseRestartAtTheInputsPosition) {
             if (c.host_seek_time)
                 p.input().time_to_position = [&](int) { return static_cast<int64_t>(moved_to); };
             else
-                ASSERT_EQ(p.input().io()->seek(p.input().io(), static_cast<cb_off_t>(moved_to), CB_SEEK_SET),
+                ASSERT_EQ(p.input().io()->seek(p.input().io(), static_cast<cb_off_t>(moved_to),
+                                               CB_SEEK_SET),
                           static_cast<cb_off_t>(moved_to));
             const size_t events = p.host.events().size();
 

@@ -23,7 +23,8 @@ struct Frame {
 std::vector<Frame> frames_of(const Player& p) {
     std::vector<Frame> out;
     for (const auto& e : const_cast<Player&>(p).host.events())
-        if (e.kind == host::EventKind::Commit && e.packet_type == 0) out.push_back({e.type, e.pts, e.crc32});
+        if (e.kind == host::EventKind::Commit && e.packet_type == 0)
+            out.push_back({e.type, e.pts, e.crc32});
     return out;
 }
 
@@ -46,7 +47,8 @@ TEST(SeekEffect, QueryOrFailedSeekLeavesDeliveryWhereItWas) {
         {"query by search", plain, HOVA_SEEK_FORWARD, 5500000, 1, HOVA_OK, 6000000},
         {"failed search", plain, HOVA_SEEK_FORWARD, 9500000, 0, HOVA_SeekFailed, 9500000},
         {"unknown direction", indexed, 2, 5500000, 0, HOVA_SeekFailed, 5500000},
-        {"target in the missing data", cut, HOVA_SEEK_BACKWARD, 7500000, 0, HOVA_SeekFailed, 7500000},
+        {"target in the missing data", cut, HOVA_SEEK_BACKWARD, 7500000, 0, HOVA_SeekFailed,
+         7500000},
     };
     for (const Case& c : cases) {
         for (int m = 0; m < 4; ++m) {
@@ -153,8 +155,9 @@ TEST(SeekEffect, SeparateParsingPlacesBothCursors) {
     p.host.events().clear();
     int64_t t = 5000000;
     ASSERT_EQ(seektest::seek(p, HOVA_SEEK_BACKWARD, &t), HOVA_OK);
-    EXPECT_TRUE(log.contains(
-        "[ASF] seek in separate mode, audio pts 5000000, packet 20, video pts 5000000, packet 50\n"));
+    EXPECT_TRUE(
+        log.contains("[ASF] seek in separate mode, audio pts 5000000, packet 20, video pts "
+                     "5000000, packet 50\n"));
     EXPECT_EQ(p.ctx()->accept_stream_type, HOVA_STREAM_VIDEO);
     ASSERT_EQ(p.play(), HOVA_EndOfStream);
     EXPECT_EQ(p.frames(HOVA_STREAM_VIDEO).front().pts, 5000000);
@@ -171,8 +174,9 @@ TEST(SeekEffect, SeparateParsingPlacesBothCursors) {
     p.host.events().clear();
     t = 4000000;
     ASSERT_EQ(seektest::seek(p, HOVA_SEEK_BACKWARD, &t), HOVA_OK);
-    EXPECT_TRUE(log.contains(
-        "[ASF] seek in separate mode, audio pts 4000000, packet 10, video pts 4000000, packet 40\n"));
+    EXPECT_TRUE(
+        log.contains("[ASF] seek in separate mode, audio pts 4000000, packet 10, video pts "
+                     "4000000, packet 40\n"));
     ASSERT_EQ(p.play(), HOVA_EndOfStream);
     EXPECT_EQ(p.frames(HOVA_STREAM_AUDIO).front().pts, 4000000);
     p.expect_clean_close();
@@ -217,7 +221,8 @@ TEST(SeekEffect, DamagedFilesNeverLeaveAnythingBehind) {
         SCOPED_TRACE(round);
         Player p(file);
         if (p.open() != HOVA_OK) continue;
-        for (int64_t target : {int64_t{1700000}, int64_t{3300000}, int64_t{-500000}, int64_t{90000000}}) {
+        for (int64_t target :
+             {int64_t{1700000}, int64_t{3300000}, int64_t{-500000}, int64_t{90000000}}) {
             for (int dir : {HOVA_SEEK_BACKWARD, HOVA_SEEK_FORWARD}) {
                 int64_t t = target;
                 const int rc = seektest::seek(p, dir, &t, static_cast<int>(rng() % 2));

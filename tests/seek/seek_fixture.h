@@ -98,7 +98,8 @@ inline Bytes build(const Clip& c) {
         if (c.audio && i < c.audio_packets) {
             const Bytes a = audio_bytes(i);
             pl.push_back(asfb::media(1, num, 0, static_cast<uint32_t>(a.size()),
-                                     static_cast<uint32_t>(audio_us(c, i) / 1000 + c.preroll_ms), a));
+                                     static_cast<uint32_t>(audio_us(c, i) / 1000 + c.preroll_ms),
+                                     a));
         }
         if (c.video) {
             const Bytes v = video_bytes(i);
@@ -112,11 +113,14 @@ inline Bytes build(const Clip& c) {
         const std::vector<uint32_t> entries = c.index_entries ? *c.index_entries : encoder_index(c);
         std::vector<asfb::IndexEntry> e;
         for (uint32_t p : entries) e.push_back({p, 1});
-        Bytes idx = asfb::simple_index(
-            c.index_interval_100ns ? *c.index_interval_100ns : uint64_t{c.index_interval_ms} * 10000, e);
+        Bytes idx =
+            asfb::simple_index(c.index_interval_100ns ? *c.index_interval_100ns
+                                                      : uint64_t{c.index_interval_ms} * 10000,
+                               e);
         if (c.index_declared_count) {
             // Entry count at offset 52 of the object.
-            for (int k = 0; k < 4; ++k) idx[52 + k] = static_cast<uint8_t>(*c.index_declared_count >> (8 * k));
+            for (int k = 0; k < 4; ++k)
+                idx[52 + k] = static_cast<uint8_t>(*c.index_declared_count >> (8 * k));
         }
         if (c.cut_after_entries) idx.resize(56 + 6 * size_t{*c.cut_after_entries});
         f.trailing.push_back(idx);

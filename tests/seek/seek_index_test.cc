@@ -22,54 +22,6 @@ Clip every_frame_key(std::vector<uint32_t> entries) {
 
 const std::vector<uint32_t> kEntries = {0, 10, 20, 25, 28, 40, 40, 70, 80, 90};
 
-TEST(IndexSeek, WalksFromTheTargetsEntryToTheNextDistinctKeyFrame) {
-    struct Case {
-        int dir;
-        int64_t target;
-        int64_t found;
-    } cases[] = {
-        // Entry 2 (packet 20); entry 3's key frame (2.5 s) is after 2.2 s.
-        {HOVA_SEEK_BACKWARD, 2200000, 2000000},
-        {HOVA_SEEK_FORWARD, 2200000, 2500000},
-        // Entries 3 and 4 are at or before 2.9 s: backward takes one step on,
-        // forward keeps walking and lands on the first one after the target.
-        {HOVA_SEEK_BACKWARD, 2900000, 2500000},
-        {HOVA_SEEK_FORWARD, 2900000, 4000000},
-        // A key frame exactly at the target: forward passes it over.
-        {HOVA_SEEK_BACKWARD, 2000000, 2000000},
-        {HOVA_SEEK_FORWARD, 2000000, 2500000},
-        // Entry 5 repeats in entry 6: backward stays on it, forward goes to
-        // the entry after the repeats.
-        {HOVA_SEEK_BACKWARD, 5500000, 4000000},
-        {HOVA_SEEK_FORWARD, 5500000, 7000000},
-        // The last entry's interval: backward is answered by the index,
-        // forward by the search without index (an exact frame at 9.5 s).
-        {HOVA_SEEK_BACKWARD, 9500000, 9000000},
-        {HOVA_SEEK_FORWARD, 9500000, 9500000},
-        // Before entry 0's time the walk starts at entry 0.
-        {HOVA_SEEK_BACKWARD, -3000000, 0},
-    };
-    for (const Case& c : cases) {
-        SCOPED_TRACE(testing::Message() << "dir " << c.dir << " target " << c.target);
-        testenv::LogCapture log;
-        Player p(seektest::build(every_frame_key(kEntries)));
-        p.open_or_fail();
-        int64_t t = c.target;
-        ASSERT_EQ(seektest::seek(p, c.dir, &t), HOVA_OK);
-        EXPECT_EQ(t, c.found);
-        // Entry 0 stands for time 0 here: the walk starts at the target's second.
-        if (c.target == 5500000) {
-            EXPECT_TRUE(log.contains("[ASF] enter asf_find_packet_by_index, index 5\n"));
-        }
-        // Delivery resumes with the video frame found.
-        ASSERT_EQ(p.play(), HOVA_EndOfStream);
-        const auto v = p.frames(HOVA_STREAM_VIDEO);
-        ASSERT_FALSE(v.empty());
-        EXPECT_EQ(v.front().pts, c.found);
-        p.expect_clean_close();
-    }
-}
-
 TEST(IndexSeek, StartOffsetIsWorkedOutOnceFromTheFirstEntryNamingAnotherPacket) {
     // Entries 0 and 1 name packet 0; entry 2 names packet 10 (1 s): entry 0
     // stands for -1 s, and 5.5 s falls in entry 6.
@@ -97,41 +49,56 @@ TEST(IndexSeek, StartOffsetIsWorkedOutOnceFromTheFirstEntryNamingAnotherPacket) 
 }
 
 // Entry 0's time is worked out from the first entry naming another packet;
-// when that packet's key frame is not that entry's own time, the target's
-// entry is off by some entries. The answer still lies on the asked side:
-// the walk steps over entries naming other packets until it does, or leaves
-// the seek to the search without index.
-TEST(IndexSeek, AnswerLiesOnTheAskedSideWhenEntryZerosTimeIsOff) {
+// when that is off, the walk still answers on the asked side, or leaves the
+// seek to the search without index.
+TEST(IndexSeek, WalksFromTheTargetsEntryToTheNextDistinctKeyFrame) {
     // Entry 4 names packet 5 (0.5 s): entry 0 stands for -3.5 s.
     const std::vector<uint32_t> early = {0, 0, 0, 0, 5, 30, 30, 30, 60, 60};
     // Entry 2 names packet 40 (4 s): entry 0 stands for +2 s.
     const std::vector<uint32_t> late = {0, 0, 40, 40, 40, 45, 60, 70, 80, 90};
+    const int B = HOVA_SEEK_BACKWARD, F = HOVA_SEEK_FORWARD;
     const struct {
         const std::vector<uint32_t>* entries;
         int dir;
-        int64_t target, found;
-        int64_t start_offset;
+        int64_t target, found, start_offset;
     } cases[] = {
-        {&early, HOVA_SEEK_BACKWARD, 5800000, 3000000, -3500000},  // entry 9 gives 6 s
-        {&early, HOVA_SEEK_BACKWARD, 2900000, 500000, -3500000},   // entry 6 gives 3 s
-        {&early, HOVA_SEEK_FORWARD, 2900000, 6000000, -3500000},
-        {&late, HOVA_SEEK_FORWARD, 5500000, 6000000, 2000000},     // entry 5 gives 4.5 s
-        {&late, HOVA_SEEK_BACKWARD, 5500000, 4000000, 2000000},
-        // Before the first key frame the index has nothing earlier: the
-        // search without index answers packet 0.
-        {&early, HOVA_SEEK_BACKWARD, -3300000, 0, -3500000},
+        // Entry 2 (packet 20); entry 3's key frame (2.5 s) is after 2.2 s.
+        {&kEntries, B, 2200000, 2000000, 0}, {&kEntries, F, 2200000, 2500000, 0},
+        // Entries 3 and 4 are at or before 2.9 s: backward takes one step on,
+        // forward walks on to the first one after the target.
+        {&kEntries, B, 2900000, 2500000, 0}, {&kEntries, F, 2900000, 4000000, 0},
+        // A key frame exactly at the target: forward passes it over.
+        {&kEntries, B, 2000000, 2000000, 0}, {&kEntries, F, 2000000, 2500000, 0},
+        // Entry 5 repeats in entry 6: backward stays, forward goes past the repeats.
+        {&kEntries, B, 5500000, 4000000, 0}, {&kEntries, F, 5500000, 7000000, 0},
+        // The last entry's interval: forward is answered by the search (9.5 s).
+        {&kEntries, B, 9500000, 9000000, 0}, {&kEntries, F, 9500000, 9500000, 0},
+        {&kEntries, B, -3000000, 0, 0},  // before entry 0's time: entry 0
+        {&early, B, 5800000, 3000000, -3500000},  // entry 9 gives 6 s
+        {&early, B, 2900000, 500000, -3500000},   // entry 6 gives 3 s
+        {&early, F, 2900000, 6000000, -3500000},
+        {&late, F, 5500000, 6000000, 2000000},    // entry 5 gives 4.5 s
+        {&late, B, 5500000, 4000000, 2000000},
+        // Before the first key frame: the search answers packet 0.
+        {&early, B, -3300000, 0, -3500000},
     };
     for (const auto& c : cases) {
         SCOPED_TRACE(testing::Message() << "dir " << c.dir << " target " << c.target);
+        testenv::LogCapture log;
         Player p(seektest::build(every_frame_key(*c.entries)));
         p.open_or_fail();
         int64_t t = c.target;
         ASSERT_EQ(seektest::seek(p, c.dir, &t), HOVA_OK);
         EXPECT_EQ(t, c.found);
         EXPECT_EQ(p.ctx()->index_start_offset, c.start_offset);
+        // Entry 0 stands for time 0 here: the walk starts at the target's second.
+        if (c.entries == &kEntries && c.target == 5500000) {
+            EXPECT_TRUE(log.contains("[ASF] enter asf_find_packet_by_index, index 5\n"));
+        }
         ASSERT_EQ(p.play(), HOVA_EndOfStream);
-        ASSERT_FALSE(p.frames(HOVA_STREAM_VIDEO).empty());
-        EXPECT_EQ(p.frames(HOVA_STREAM_VIDEO).front().pts, c.found);
+        const auto v = p.frames(HOVA_STREAM_VIDEO);
+        ASSERT_FALSE(v.empty());
+        EXPECT_EQ(v.front().pts, c.found);
         p.expect_clean_close();
     }
 }
@@ -142,30 +109,18 @@ TEST(IndexSeek, IndexThatCannotAnswerLeavesTheSeekToTheSearch) {
         Clip clip;
         bool index_answers;
     };
-    std::vector<Case> cases;
-    {
-        Clip c;  // entries past the data
-        c.index_entries = std::vector<uint32_t>(10, 5000);
-        cases.push_back({"past the data", c, false});
-    }
-    {
-        Clip c;  // more entries declared than the file holds
-        c.index_declared_count = 1000;
-        c.cut_after_entries = 2;
-        cases.push_back({"beyond the end of the file", c, false});
-    }
-    {
-        Clip c;
-        c.index_interval_100ns = 0;
-        cases.push_back({"interval 0", c, false});
-    }
-    {
-        // Every entry names packet 30: the index answers backward with it;
-        // forward its key frame lies before the target.
-        Clip c;
-        c.index_entries = std::vector<uint32_t>(10, 30);
-        cases.push_back({"all one packet", c, true});
-    }
+    std::vector<Case> cases(4, Case{"", Clip{}, false});
+    cases[0].what = "past the data";
+    cases[0].clip.index_entries = std::vector<uint32_t>(10, 5000);
+    cases[1].what = "more entries declared than the file holds";
+    cases[1].clip.index_declared_count = 1000;
+    cases[1].clip.cut_after_entries = 2;
+    cases[2].what = "interval 0";
+    cases[2].clip.index_interval_100ns = 0;
+    // Every entry names packet 30: backward answers with it; forward's key
+    // frame lies before the target.
+    cases[3] = {"all one packet", Clip{}, true};
+    cases[3].clip.index_entries = std::vector<uint32_t>(10, 30);
     for (const Case& k : cases) {
         for (int dir : {HOVA_SEEK_BACKWARD, HOVA_SEEK_FORWARD}) {
             SCOPED_TRACE(testing::Message() << k.what << ", dir " << dir);

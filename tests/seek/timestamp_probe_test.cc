@@ -26,7 +26,8 @@ Bytes probe_file() {
     };
     const std::vector<asfb::Payload> p1 = {
         asfb::compressed(1, 2, 200, 10, {asfb::pattern(20, 6), asfb::pattern(25, 7)})};
-    const std::vector<asfb::Payload> p2 = {asfb::media(2, 4, 0, 40, 400, asfb::pattern(40, 8), true)};
+    const std::vector<asfb::Payload> p2 = {
+        asfb::media(2, 4, 0, 40, 400, asfb::pattern(40, 8), true)};
     asfb::PacketFile f;
     f.packet_size = kPacket;
     f.preroll_ms = 150;
