@@ -1,8 +1,8 @@
-// Every mode against a plain model of the file: random reads, peeks and
-// seeks over random data give the same bytes, positions and end-of-input
-// answers whatever the buffering. Also the seek/thread hand-over under
-// stress: after an out-of-buffer seek the reader sees only bytes from the
-// new position, in order.
+// The buffered reader against a plain model of the file: random reads, peeks
+// and seeks give the same bytes, positions and end-of-input answers in every
+// mode; seeks and the host's time moves never let stale bytes through while
+// the streaming thread runs; two cursors read each byte once; closing never
+// frees the blocks under a waiting or stalled thread.
 #include <atomic>
 #include <thread>
 
@@ -174,4 +174,74 @@ TEST(ReaderEquivalence, TwoCursorsReadEachByteOnce) {
         }
         EXPECT_LE(r.in_->counters().bytes_read, kSize + 4096) << "a block at most beyond the end";
     }
+}
+
+TEST(ReaderEquivalence, TimeMovesWhileTheThreadReadsLoseNothing) {
+    // The host's time seek and the reader's reset are one step for the
+    // streaming thread: after each, the reader returns exactly the input's
+    // bytes from the new position, whatever the thread was doing. Tiny blocks
+    // and an input that naps now and then put the move in every phase of the
+    // thread's loop.
+    constexpr size_t kSize = 1 << 17;
+    Reader r(pattern(kSize, 7), options_for(Mode::Thread, 41, 41 * 3 + 3));
+    std::atomic<uint32_t> tick{0};
+    r.in_->faults().before_read = [&](uint64_t, size_t) {
+        const uint32_t t = tick.fetch_add(1);
+        if (t % 5 == 0) std::this_thread::yield();
+        if (t % 89 == 0) std::this_thread::sleep_for(std::chrono::microseconds(30));
+    };
+    r.in_->time_to_position = [](int ms) -> int64_t { return ms; };
+    ASSERT_EQ(r.open(), 0);
+    std::mt19937 rng(3);
+    uint8_t buf[200];
+    for (int i = 0; i < 3000; ++i) {
+        const int ms = static_cast<int>(rng() % kSize);
+        if (rng() % 2) {
+            cb_seek_time_reset(&r.cb_, ms);
+        } else {
+            // A flush: the host puts its input where it likes.
+            r.in_->time_to_position = [ms](int) -> int64_t { return ms; };
+            cb_flush_data(&r.cb_);
+            r.in_->time_to_position = [](int t) -> int64_t { return t; };
+        }
+        ASSERT_EQ(cb_tell64(&r.cb_), static_cast<uint64_t>(ms)) << "step " << i;
+        uint64_t pos = static_cast<uint64_t>(ms);
+        for (int k = 0; k < 3; ++k) {
+            const int32_t n = 1 + static_cast<int32_t>(rng() % 200);
+            const int32_t got = r.read(buf, n);
+            ASSERT_EQ(std::vector<uint8_t>(buf, buf + got), r.slice(pos, static_cast<size_t>(n)))
+                << "at " << pos << " step " << i;
+            pos += static_cast<uint64_t>(got);
+        }
+    }
+}
+
+TEST(ReaderClose, CloseWhileTheThreadWaitsForRoomEndsTheThread) {
+    // A peek fills the ring and nobody reads: the thread waits for room.
+    Reader r(pattern(100000), options_for(Mode::Thread, 64, 256));
+    ASSERT_EQ(r.open(), 0);
+    uint8_t p[192];
+    ASSERT_EQ(r.peek(p, 192), 192);
+    r.close();
+    EXPECT_EQ(r.host_.outstanding_blocks(), 0u);
+    EXPECT_EQ(r.cb_.thread_type, CB_SINGLE_THREAD);
+}
+
+TEST(ReaderClose, CloseWhileTheInputStallsWaitsForTheReadToReturn) {
+    Reader r(pattern(100000), options_for(Mode::Thread, 64, 4096));
+    std::atomic<bool> in_read{false}, release{false};
+    r.in_->faults().before_read = [&](uint64_t pos, size_t) {
+        if (pos == 0) return;
+        in_read = true;
+        while (!release) sched_yield();
+    };
+    ASSERT_EQ(r.open(), 0);
+    while (!in_read) sched_yield();
+    std::thread releaser([&] {
+        std::this_thread::sleep_for(std::chrono::milliseconds(20));
+        release = true;
+    });
+    r.close();  // must not free the blocks under the thread's read
+    EXPECT_TRUE(release.load());
+    releaser.join();
 }
