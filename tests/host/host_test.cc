@@ -64,45 +64,28 @@ TEST(RawInput, ReadsSeeksAndTellsOverMemoryAndFile) {
 }
 
 TEST(RawInput, FaultsAreThoseAskedFor) {
-    const std::vector<uint8_t> data = iota_bytes(4096);
-    {
-        auto in = host::RawInput::from_memory(data);
-        in->faults().end_after = 1000;
-        in->faults().max_read = 300;
-        std::vector<uint8_t> got;
-        EXPECT_EQ(read_all(in->io(), &got, 4096), 1000u);
-        EXPECT_EQ(in->counters().reads, 5u) << "4 short reads of 300/300/300/100, then the end";
-    }
-    {
-        auto in = host::RawInput::from_memory(data);
-        in->faults().refuse_seek = true;
-        EXPECT_EQ(in->io()->seek(in->io(), 0, CB_SEEK_SET), -1);
-    }
-    {
-        auto in = host::RawInput::from_memory(data);
-        in->faults().fail_seeks_after = 2;
-        EXPECT_EQ(in->io()->seek(in->io(), 1, CB_SEEK_SET), 1);
-        EXPECT_EQ(in->io()->seek(in->io(), 2, CB_SEEK_SET), 2);
-        EXPECT_EQ(in->io()->seek(in->io(), 3, CB_SEEK_SET), -1);
-    }
-    {
-        auto in = host::RawInput::from_memory(data);
-        in->faults().fail_reads_after = 1;
-        uint8_t b[8];
-        EXPECT_EQ(in->io()->read(in->io(), b, 8), 8u);
-        EXPECT_EQ(in->io()->read(in->io(), b, 8), 0u);
-    }
-    {
-        // Network-like arrival: 100 bytes at first, 50 more per read call.
-        auto in = host::RawInput::from_memory(data);
-        in->faults().visible_start = 100;
-        in->faults().grow_per_read = 50;
-        uint8_t b[1000];
-        EXPECT_EQ(in->io()->read(in->io(), b, 1000), 100u);
-        EXPECT_EQ(in->io()->read(in->io(), b, 1000), 50u);
-        EXPECT_EQ(in->io()->read(in->io(), b, 1000), 50u);
-        EXPECT_EQ(b[0], 150);
-    }
+    auto in = [](auto set) {
+        auto r = host::RawInput::from_memory(iota_bytes(4096));
+        set(r->faults());
+        return r;
+    };
+    uint8_t b[1000];
+    std::vector<uint8_t> got;
+    auto a = in([](host::InputFaults& f) { f.end_after = 1000, f.max_read = 300; });
+    EXPECT_EQ(read_all(a->io(), &got, 4096), 1000u);
+    EXPECT_EQ(a->counters().reads, 5u) << "4 short reads of 300/300/300/100, then the end";
+    auto r = in([](host::InputFaults& f) { f.refuse_seek = true; });
+    EXPECT_EQ(r->io()->seek(r->io(), 0, CB_SEEK_SET), -1);
+    auto s = in([](host::InputFaults& f) { f.fail_seeks_after = 2; });
+    for (cb_off_t k : {1, 2}) EXPECT_EQ(s->io()->seek(s->io(), k, CB_SEEK_SET), k);
+    EXPECT_EQ(s->io()->seek(s->io(), 3, CB_SEEK_SET), -1);
+    auto f = in([](host::InputFaults& x) { x.fail_reads_after = 1; });
+    EXPECT_EQ(f->io()->read(f->io(), b, 8), 8u);
+    EXPECT_EQ(f->io()->read(f->io(), b, 8), 0u);
+    // Network-like arrival: 100 bytes at first, 50 more per read call.
+    auto g = in([](host::InputFaults& x) { x.visible_start = 100, x.grow_per_read = 50; });
+    for (size_t want : {100u, 50u, 50u}) EXPECT_EQ(g->io()->read(g->io(), b, 1000), want);
+    EXPECT_EQ(b[0], 150);
 }
 
 TEST(RawInput, FlagsAndOptionalOperations) {
