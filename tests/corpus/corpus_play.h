@@ -45,7 +45,8 @@ struct Player {
     }
     // get_data until something other than OK or TryAgain (or `max` calls in all).
     int play(uint64_t max = 1000000) {
-        while (rc == HOVA_OK && calls < max && (last < 0 || last == HOVA_OK || last == HOVA_TryAgain))
+        while (rc == HOVA_OK && calls < max &&
+               (last < 0 || last == HOVA_OK || last == HOVA_TryAgain))
             step();
         return last;
     }
@@ -55,8 +56,8 @@ struct Player {
         std::vector<std::string> out;
         for (const HostEvent& e : cb().events()) {
             std::ostringstream l;
-            l << e.call << ' ' << static_cast<int>(e.kind) << ' ' << e.type << ' '
-              << e.packet_type << ' ' << e.size << ' ' << e.pts << ' ' << e.crc32;
+            l << e.call << ' ' << static_cast<int>(e.kind) << ' ' << e.type << ' ' << e.packet_type
+              << ' ' << e.size << ' ' << e.pts << ' ' << e.crc32;
             out.push_back(l.str());
         }
         out.push_back("last " + std::to_string(last) + " calls " + std::to_string(calls));

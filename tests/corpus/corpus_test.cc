@@ -47,10 +47,11 @@ std::vector<Ref> reference(const json& ref, const char* kind, bool timed_only, i
     std::vector<Ref> out;
     for (const auto& p : ref["packets"]) {
         if (p["stream"].get<int>() != *index || (timed_only && p["pts_ms"].is_null())) continue;
-        out.push_back({p["pts_ms"].is_null() ? -1000 : p["pts_ms"].get<int64_t>() * 1000,
-                       p["size"].get<uint32_t>(),
-                       static_cast<uint32_t>(std::stoul(p["crc32"].get<std::string>(), nullptr, 16)),
-                       p.value("key", false)});
+        out.push_back(
+            {p["pts_ms"].is_null() ? -1000 : p["pts_ms"].get<int64_t>() * 1000,
+             p["size"].get<uint32_t>(),
+             static_cast<uint32_t>(std::stoul(p["crc32"].get<std::string>(), nullptr, 16)),
+             p.value("key", false)});
     }
     return out;
 }
@@ -117,8 +118,8 @@ TEST_P(CorpusDelivery, FramesMatchTheReferenceInEveryBufferingMode) {
     ASSERT_FALSE(eos.empty());
     EXPECT_EQ(base.cb().events().back().kind, host::EventKind::Notify);
     const bool ffmpeg = run("ffmpeg -version >/dev/null 2>&1");
-    for (auto [type, kind] : {std::pair{HOVA_STREAM_AUDIO, "audio"},
-                                std::pair{HOVA_STREAM_VIDEO, "video"}}) {
+    for (auto [type, kind] :
+         {std::pair{HOVA_STREAM_AUDIO, "audio"}, std::pair{HOVA_STREAM_VIDEO, "video"}}) {
         SCOPED_TRACE(kind);
         int index = -1;
         const std::vector<Ref> pk = reference(ref, kind, false, &index);
@@ -132,11 +133,14 @@ TEST_P(CorpusDelivery, FramesMatchTheReferenceInEveryBufferingMode) {
         if (!ffmpeg) continue;
         std::string copy;
         run("ffmpeg -v quiet -i '" + path + "' -map 0:" + std::to_string(index) +
-                " -c copy -f data - 2>/dev/null", &copy);
+                " -c copy -f data - 2>/dev/null",
+            &copy);
         std::vector<uint8_t> mine;
-        for (const host::HostEvent& f : frames) mine.insert(mine.end(), f.bytes.begin(), f.bytes.end());
+        for (const host::HostEvent& f : frames)
+            mine.insert(mine.end(), f.bytes.begin(), f.bytes.end());
         ASSERT_LE(mine.size(), copy.size());
-        EXPECT_TRUE(std::equal(mine.begin(), mine.end(), reinterpret_cast<const uint8_t*>(copy.data())))
+        EXPECT_TRUE(
+            std::equal(mine.begin(), mine.end(), reinterpret_cast<const uint8_t*>(copy.data())))
             << "committed bytes differ from the stream copy";
     }
     base.expect_clean_close();
@@ -167,10 +171,12 @@ std::vector<uint8_t> with_longer_extension_tail(std::vector<uint8_t> f) {
             if (!std::equal(kExtStream, kExtStream + 4, f.begin() + static_cast<long>(c))) continue;
             std::vector<uint8_t> systems;
             for (int i = 0; i < 3; ++i) {
-                for (int k = 0; k < 16; ++k) systems.push_back(static_cast<uint8_t>(0x40 + 16 * i + k));
+                for (int k = 0; k < 16; ++k)
+                    systems.push_back(static_cast<uint8_t>(0x40 + 16 * i + k));
                 systems.insert(systems.end(), {0xFF, 0xFF, 0, 0, 0, 0});
             }
-            f.insert(f.begin() + static_cast<long>(c + le(f, c + 16, 8)), systems.begin(), systems.end());
+            f.insert(f.begin() + static_cast<long>(c + le(f, c + 16, 8)), systems.begin(),
+                     systems.end());
             add_le(f, c + 16, 8, 66);
             add_le(f, c + 24 + 62, 2, 3);
             add_le(f, at + 16, 8, 66);
@@ -238,11 +244,21 @@ std::string asfdump_info(const std::string& path, const char* redirect) {
 }
 
 TEST(CorpusInfo, AgreesWithFfprobe) {
-    static const std::map<std::string, std::string> kCodecNames = {
-        {"wmav1", "WMA1"}, {"wmav2", "WMA2"}, {"wmapro", "WMA3"}, {"wmalossless", "WMA_LOSSLESS"},
-        {"wmavoice", "WMA_VOICE"}, {"mp3", "MP3"}, {"aac", "AAC"}, {"ac3", "AC3"},
-        {"vc1", "WVC1"}, {"wmv1", "WMV1"}, {"wmv2", "WMV2"}, {"wmv3", "WMV3"},
-        {"msmpeg4v3", "DIV3"}, {"msmpeg4v2", "MP42"}, {"mpeg4", "M4V"}};
+    static const std::map<std::string, std::string> kCodecNames = {{"wmav1", "WMA1"},
+                                                                   {"wmav2", "WMA2"},
+                                                                   {"wmapro", "WMA3"},
+                                                                   {"wmalossless", "WMA_LOSSLESS"},
+                                                                   {"wmavoice", "WMA_VOICE"},
+                                                                   {"mp3", "MP3"},
+                                                                   {"aac", "AAC"},
+                                                                   {"ac3", "AC3"},
+                                                                   {"vc1", "WVC1"},
+                                                                   {"wmv1", "WMV1"},
+                                                                   {"wmv2", "WMV2"},
+                                                                   {"wmv3", "WMV3"},
+                                                                   {"msmpeg4v3", "DIV3"},
+                                                                   {"msmpeg4v2", "MP42"},
+                                                                   {"mpeg4", "M4V"}};
     int compared = 0;
     for (const std::string& path : testenv::corpus_files()) {
         const json ref = load_ref(path);
@@ -323,7 +339,8 @@ TEST(CorpusInfo, SameAnswersInEveryBufferingMode) {
         SCOPED_TRACE(path);
         const std::vector<uint8_t> bytes = testenv::read_file_or_empty(path);
         std::vector<std::string> answers;
-        for (host::Buffering b : {host::Buffering::None, host::Buffering::Cache, host::Buffering::Thread}) {
+        for (host::Buffering b :
+             {host::Buffering::None, host::Buffering::Cache, host::Buffering::Thread}) {
             Player p(bytes, with_buffering(b));
             std::string a = std::to_string(p.rc);
             if (p.rc == HOVA_OK) {
@@ -364,19 +381,22 @@ void add_made_files(std::vector<SweepFile>* files) {
     for (std::string codec : {"wmv1", "wmv2"}) {
         const std::string path = std::string(dir) + "/" + codec + ".wmv";
         std::string out;
-        if (!run("ffmpeg -v error -f lavfi -i testsrc=size=160x120:rate=25:duration=7 -c:v " + codec +
-                 " -g 50 -f asf " + path) ||
+        if (!run("ffmpeg -v error -f lavfi -i testsrc=size=160x120:rate=25:duration=7 -c:v " +
+                 codec + " -g 50 -f asf " + path) ||
             !run("ffprobe -v quiet -print_format json -show_packets -show_data_hash CRC32 "
-                 "-select_streams v " + path, &out))
+                 "-select_streams v " +
+                     path,
+                 &out))
             continue;
         SweepFile f{"ffmpeg-" + codec + ".wmv", testenv::read_file_or_empty(path), {}, true};
         const json probed = json::parse(out);
         for (const auto& pk : probed["packets"]) {
             const std::string hash = pk["data_hash"].get<std::string>();
-            f.own.push_back({std::llround(std::stod(pk["pts_time"].get<std::string>()) * 1000) * 1000,
-                             static_cast<uint32_t>(std::stoul(pk["size"].get<std::string>())),
-                             static_cast<uint32_t>(std::stoul(hash.substr(hash.find(':') + 1), nullptr, 16)),
-                             pk["flags"].get<std::string>().find('K') != std::string::npos});
+            f.own.push_back(
+                {std::llround(std::stod(pk["pts_time"].get<std::string>()) * 1000) * 1000,
+                 static_cast<uint32_t>(std::stoul(pk["size"].get<std::string>())),
+                 static_cast<uint32_t>(std::stoul(hash.substr(hash.find(':') + 1), nullptr, 16)),
+                 pk["flags"].get<std::string>().find('K') != std::string::npos});
         }
         files->push_back(std::move(f));
         std::remove(path.c_str());
@@ -426,58 +446,66 @@ TEST(CorpusSeek, SweepLandsOnTheAskedSideAndDeliversTheKeyFrame) {
             {had_index ? "index" : "none", f.bytes}};
         if (had_index) {  // the copy cut after the data object: no index
             std::vector<uint8_t> cut = f.bytes;
-            const uint64_t end = first_packet < 50 ? cut.size() : first_packet - 50 +
-                plimo::load_le<uint64_t>(cut.data() + first_packet - 50 + 16);
+            const uint64_t end =
+                first_packet < 50
+                    ? cut.size()
+                    : first_packet - 50 +
+                          plimo::load_le<uint64_t>(cut.data() + first_packet - 50 + 16);
             cut.resize(std::min<uint64_t>(end, cut.size()));
             variants.push_back({"cut", cut});
         }
         for (const auto& [variant, bytes] : variants)
-        for (bool cache : {true, false})
-        for (int k = 1; k <= 20; ++k)
-        for (int dir : {HOVA_SEEK_BACKWARD, HOVA_SEEK_FORWARD}) {
-            const int64_t target = f.own.back().pts_us * k / 21 + 7000;
-            SCOPED_TRACE(testing::Message() << f.name << " " << variant << " cache " << cache
-                                            << " target " << target << " dir " << dir);
-            host::InputOptions in;
-            in.disable_cache = !cache;
-            Player p(bytes, in);
-            ASSERT_EQ(p.rc, HOVA_OK);
-            int64_t found = target;
-            const int rc = p.seek(dir, &found);
-            int before = -1;  // frames of the kind delivered before the one found
-            uint32_t crc = 0;
-            for (int calls = 0; rc == HOVA_OK && calls < 100000 && before < 0; ++calls) {
-                const int r = p.step();
-                const auto frames = p.frames(kind);
-                for (size_t i = 0; i < frames.size() && before < 0; ++i)
-                    if (frames[i].pts == found) before = static_cast<int>(i), crc = frames[i].crc32;
-                if ((r != HOVA_OK && r != HOVA_TryAgain) || frames.size() > 120) break;
-            }
-            p.expect_clean_close();
-            std::printf("%-40s %-6s %-6s %-8s %12" PRId64 " %3d %12" PRId64 " %7d\n", f.name.c_str(),
-                        variant, cache ? "cache" : "none", dir == HOVA_SEEK_BACKWARD ? "backward" : "forward",
-                        target, rc, rc == HOVA_OK ? found : -1, before);
-            if (dir == HOVA_SEEK_FORWARD && keys.back() < target) {
-                EXPECT_EQ(rc, HOVA_SeekFailed);
-                continue;
-            }
-            ASSERT_EQ(rc, HOVA_OK);
-            EXPECT_TRUE(dir == HOVA_SEEK_BACKWARD ? found <= target : found >= target) << found;
-            if (dir == HOVA_SEEK_BACKWARD && keys.front() > target) {
-                EXPECT_EQ(found, 0);
-                continue;
-            }
-            const Ref* key = nullptr;
-            for (const Ref& r : f.own)
-                if (r.key && r.pts_us == found && !key) key = &r;
-            ASSERT_NE(key, nullptr) << found << " is no reference key frame";
-            if (key == &f.own.back()) continue;  // the last object stays pending
-            EXPECT_GE(before, 0) << "the frame at " << found << " was not delivered";
-            if (f.video) {
-                EXPECT_EQ(crc, key->crc);
-                EXPECT_LE(before, 8);
-            }
-        }
+            for (bool cache : {true, false})
+                for (int k = 1; k <= 20; ++k)
+                    for (int dir : {HOVA_SEEK_BACKWARD, HOVA_SEEK_FORWARD}) {
+                        const int64_t target = f.own.back().pts_us * k / 21 + 7000;
+                        SCOPED_TRACE(testing::Message()
+                                     << f.name << " " << variant << " cache " << cache << " target "
+                                     << target << " dir " << dir);
+                        host::InputOptions in;
+                        in.disable_cache = !cache;
+                        Player p(bytes, in);
+                        ASSERT_EQ(p.rc, HOVA_OK);
+                        int64_t found = target;
+                        const int rc = p.seek(dir, &found);
+                        int before = -1;  // frames of the kind delivered before the one found
+                        uint32_t crc = 0;
+                        for (int calls = 0; rc == HOVA_OK && calls < 100000 && before < 0;
+                             ++calls) {
+                            const int r = p.step();
+                            const auto frames = p.frames(kind);
+                            for (size_t i = 0; i < frames.size() && before < 0; ++i)
+                                if (frames[i].pts == found)
+                                    before = static_cast<int>(i), crc = frames[i].crc32;
+                            if ((r != HOVA_OK && r != HOVA_TryAgain) || frames.size() > 120) break;
+                        }
+                        p.expect_clean_close();
+                        std::printf("%-40s %-6s %-6s %-8s %12" PRId64 " %3d %12" PRId64 " %7d\n",
+                                    f.name.c_str(), variant, cache ? "cache" : "none",
+                                    dir == HOVA_SEEK_BACKWARD ? "backward" : "forward", target, rc,
+                                    rc == HOVA_OK ? found : -1, before);
+                        if (dir == HOVA_SEEK_FORWARD && keys.back() < target) {
+                            EXPECT_EQ(rc, HOVA_SeekFailed);
+                            continue;
+                        }
+                        ASSERT_EQ(rc, HOVA_OK);
+                        EXPECT_TRUE(dir == HOVA_SEEK_BACKWARD ? found <= target : found >= target)
+                            << found;
+                        if (dir == HOVA_SEEK_BACKWARD && keys.front() > target) {
+                            EXPECT_EQ(found, 0);
+                            continue;
+                        }
+                        const Ref* key = nullptr;
+                        for (const Ref& r : f.own)
+                            if (r.key && r.pts_us == found && !key) key = &r;
+                        ASSERT_NE(key, nullptr) << found << " is no reference key frame";
+                        if (key == &f.own.back()) continue;  // the last object stays pending
+                        EXPECT_GE(before, 0) << "the frame at " << found << " was not delivered";
+                        if (f.video) {
+                            EXPECT_EQ(crc, key->crc);
+                            EXPECT_LE(before, 8);
+                        }
+                    }
     }
 }
 

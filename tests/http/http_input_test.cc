@@ -36,8 +36,10 @@ host::LocalWebServer* web_server(std::string* why) {
         reason = "the host is built without HTTP input (libcurl missing)";
         return nullptr;
 #endif
-        if (testenv::corpus_files().empty()) reason = "no corpus in " + testenv::corpus_dir();
-        else server = host::LocalWebServer::start(testenv::corpus_dir(), &reason);
+        if (testenv::corpus_files().empty())
+            reason = "no corpus in " + testenv::corpus_dir();
+        else
+            server = host::LocalWebServer::start(testenv::corpus_dir(), &reason);
     }
     *why = reason;
     return server.get();
@@ -68,7 +70,8 @@ Played play(std::unique_ptr<host::RawInput> input, int64_t seek_us = -1, uint64_
         out.found = seek_us;
         out.seek_rc = p.seek(HOVA_SEEK_BACKWARD, &out.found);
         const size_t from = p.cb().events().size();
-        while (!p.framed_since(from) && p.calls < 1000 && p.step() != HOVA_EndOfStream) {}
+        while (!p.framed_since(from) && p.calls < 1000 && p.step() != HOVA_EndOfStream) {
+        }
     }
     p.play(max);
     out.rc = p.rc;
@@ -101,7 +104,8 @@ TEST(HttpInput, EveryCorpusFileByUrlGivesTheFileEventsInEveryMode) {
         for (const std::string& e : whole.events) {
             int64_t call, kind, type, pt, size, pts;
             if (std::sscanf(e.c_str(), "%ld %ld %ld %ld %ld %ld", &call, &kind, &type, &pt, &size,
-                            &pts) == 6 && kind == 0 && pt == 0)
+                            &pts) == 6 &&
+                kind == 0 && pt == 0)
                 last_pts = std::max(last_pts, pts);
         }
         for (host::Buffering b : kBufferings) {
@@ -111,7 +115,8 @@ TEST(HttpInput, EveryCorpusFileByUrlGivesTheFileEventsInEveryMode) {
             EXPECT_EQ(input->io()->streaming, 1);
             EXPECT_EQ(input->io()->seekable, 1);
             EXPECT_EQ(input->io()->input_size, input->size());
-            const Played net = play(std::move(input)), local = play(by_file(path, with_buffering(b)));
+            const Played net = play(std::move(input)),
+                         local = play(by_file(path, with_buffering(b)));
             EXPECT_EQ(net.rc, local.rc);
             EXPECT_EQ(net.events, local.events);
             EXPECT_EQ(net.blocks, 0u);
@@ -119,7 +124,8 @@ TEST(HttpInput, EveryCorpusFileByUrlGivesTheFileEventsInEveryMode) {
             EXPECT_LE(net.requests, 3u) << "the first, at most a jump to the index and one back";
             if (whole.rc != HOVA_OK || last_pts <= 0) continue;
             // A seek halfway lands where it lands from the file, with the same frames after it.
-            const Played sn = play(by_url(server->url(base_name(path)), with_buffering(b)), last_pts / 2, 200);
+            const Played sn =
+                play(by_url(server->url(base_name(path)), with_buffering(b)), last_pts / 2, 200);
             const Played sl = play(by_file(path, with_buffering(b)), last_pts / 2, 200);
             EXPECT_EQ(sn.seek_rc, sl.seek_rc);
             EXPECT_EQ(sn.found, sl.found);
@@ -142,18 +148,23 @@ TEST(HttpInput, SeekCostsOneRequest) {
     ASSERT_EQ(input->size(), file.size());
     cb_io_st* io = input->io();
     const int64_t size = static_cast<int64_t>(file.size());
-    const int64_t rt = static_cast<int64_t>(opt.read_through), hist = static_cast<int64_t>(opt.history);
+    const int64_t rt = static_cast<int64_t>(opt.read_through),
+                  hist = static_cast<int64_t>(opt.history);
     const struct {
         const char* what;
         int64_t to;  // where to seek first, -1: read on
         size_t len;
         uint64_t requests;
     } steps[] = {
-        {"first bytes (the open's request)", -1, 4096, 0}, {"peek and back", 0, 4096, 0},
-        {"read on", -1, 100000, 0}, {"back within what was kept", 100000 - hist / 2, 1000, 0},
+        {"first bytes (the open's request)", -1, 4096, 0},
+        {"peek and back", 0, 4096, 0},
+        {"read on", -1, 100000, 0},
+        {"back within what was kept", 100000 - hist / 2, 1000, 0},
         {"short skip forward reads through", 101000 + rt / 2, 1000, 0},
-        {"far forward", size / 2, 200000, 1}, {"far back", 100, 1000, 1},
-        {"the end", size - 100, 100, 1}, {"past the end", -1, 100, 0},
+        {"far forward", size / 2, 200000, 1},
+        {"far back", 100, 1000, 1},
+        {"the end", size - 100, 100, 1},
+        {"past the end", -1, 100, 0},
         {"far forward again", 300000, 1000, 1},
         // Beyond what may wait ahead (the window and one delivery) plus the gap.
         {"forward past the read-through gap",
@@ -194,7 +205,9 @@ TEST(HttpInput, SeekOverKnownIndexEntriesCostsOneRequest) {
             const uint64_t before = http->stats().requests;
             ASSERT_EQ(p.seek(HOVA_SEEK_BACKWARD, &target), HOVA_OK);
             const size_t from = p.cb().events().size();
-            for (int c = 0; !p.framed_since(from) && c < 1000 && p.step() != HOVA_EndOfStream; ++c) {}
+            for (int c = 0; !p.framed_since(from) && c < 1000 && p.step() != HOVA_EndOfStream;
+                 ++c) {
+            }
             cost = http->stats().requests - before;
         }
         EXPECT_EQ(answers[2], answers[0]);
@@ -219,7 +232,8 @@ TEST(HttpInput, ServerWithoutRangesPlaysInOnePassAndRefusesSeeks) {
         EXPECT_EQ(net.events, play(by_file(path, in)).events);
         EXPECT_EQ(net.requests, 1u);
         EXPECT_EQ(net.blocks, 0u);
-        const Played seek = play(by_url(server->url(base_name(path), false), with_buffering(b)), 20000000, 50);
+        const Played seek =
+            play(by_url(server->url(base_name(path), false), with_buffering(b)), 20000000, 50);
         EXPECT_NE(seek.seek_rc, HOVA_OK);
         EXPECT_EQ(seek.requests, 1u);
         EXPECT_EQ(seek.blocks, 0u);
@@ -238,8 +252,8 @@ public:
         a.sin_family = AF_INET;
         a.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
         socklen_t len = sizeof a;
-        if (fd_ < 0 || ::bind(fd_, reinterpret_cast<sockaddr*>(&a), sizeof a) != 0 || ::listen(fd_, 8) != 0 ||
-            ::getsockname(fd_, reinterpret_cast<sockaddr*>(&a), &len) != 0)
+        if (fd_ < 0 || ::bind(fd_, reinterpret_cast<sockaddr*>(&a), sizeof a) != 0 ||
+            ::listen(fd_, 8) != 0 || ::getsockname(fd_, reinterpret_cast<sockaddr*>(&a), &len) != 0)
             return;
         port_ = ntohs(a.sin_port);
         thread_ = std::thread([this] { serve(); });
@@ -255,7 +269,8 @@ public:
 private:
     void serve() {
         const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(60);
-        for (int served = 0; !stop_ && served < 64 && std::chrono::steady_clock::now() < deadline;) {
+        for (int served = 0;
+             !stop_ && served < 64 && std::chrono::steady_clock::now() < deadline;) {
             pollfd p{fd_, POLLIN, 0};
             if (::poll(&p, 1, 50) != 1) continue;
             const int c = ::accept(fd_, nullptr, nullptr);
@@ -282,10 +297,10 @@ private:
         const uint64_t size = file_.size(), half = size / 2;
         if (from >= size) from = size;
         const uint64_t until = from < half ? half : size;
-        const std::string head = "HTTP/1.1 206 Partial Content\r\nContent-Length: " + std::to_string(size - from) +
-                                 "\r\nContent-Range: bytes " + std::to_string(from) + "-" +
-                                 std::to_string(size - 1) + "/" + std::to_string(size) +
-                                 "\r\nConnection: close\r\n\r\n";
+        const std::string head =
+            "HTTP/1.1 206 Partial Content\r\nContent-Length: " + std::to_string(size - from) +
+            "\r\nContent-Range: bytes " + std::to_string(from) + "-" + std::to_string(size - 1) +
+            "/" + std::to_string(size) + "\r\nConnection: close\r\n\r\n";
         if (!send_all(c, head.data(), head.size())) return;
         send_all(c, file_.data() + from, static_cast<size_t>(until - from));
     }
@@ -341,7 +356,8 @@ TEST(HttpInput, AsfdumpTakesAUrlWhereItTakesAFile) {
     CuttingServer cutting(testenv::read_file_or_empty(path));
     const std::string err = "/tmp/plimo_http_err_" + std::to_string(::getpid());
     auto asfdump = [&](const std::string& args, std::string* out, std::string* stderr_text) {
-        const int rc = testenv::run_command(testenv::asfdump_path() + " " + args + " 2>" + err, out);
+        const int rc =
+            testenv::run_command(testenv::asfdump_path() + " " + args + " 2>" + err, out);
         std::ifstream f(err);
         std::stringstream t;
         t << f.rdbuf();
@@ -356,11 +372,14 @@ TEST(HttpInput, AsfdumpTakesAUrlWhereItTakesAFile) {
         std::string message;  // on stderr
     };
     const Case cases[] = {
-        {"frames " + url, 0, "frames '" + path + "' --streaming --buffer ring --thread", "asfdump: http: "},
-        {"frames " + url + " --buffer none --seek 10000000", 0, "frames '" + path + "' --streaming --buffer none --seek 10000000", ""},
+        {"frames " + url, 0, "frames '" + path + "' --streaming --buffer ring --thread",
+         "asfdump: http: "},
+        {"frames " + url + " --buffer none --seek 10000000", 0,
+         "frames '" + path + "' --streaming --buffer none --seek 10000000", ""},
         {"info " + url, 0, "info '" + path + "' --streaming", ""},
         {"probe " + url, 0, "probe '" + path + "'", ""},
-        {"frames " + server->url(base_name(path), false) + " --seek 10000000", 0, "", "ignores range requests"},
+        {"frames " + server->url(base_name(path), false) + " --seek 10000000", 0, "",
+         "ignores range requests"},
         {"info " + server->url("no-such-file.wmv"), 3, "", "HTTP status 404"},
         {"frames http://127.0.0.1:1/x.wmv", 3, "", "cannot read"},
         {"frames " + cutting.url(), 3, "", "connection cut at byte"},
@@ -377,7 +396,8 @@ TEST(HttpInput, AsfdumpTakesAUrlWhereItTakesAFile) {
             EXPECT_EQ(out, ref);
         }
         if (c.status != 0 && c.args.rfind("frames", 0) == 0 && !out.empty()) {
-            EXPECT_NE(out.find("\"blocks_outstanding\":0"), std::string::npos) << "the cut stream closes cleanly";
+            EXPECT_NE(out.find("\"blocks_outstanding\":0"), std::string::npos)
+                << "the cut stream closes cleanly";
         }
     }
     ::unlink(err.c_str());

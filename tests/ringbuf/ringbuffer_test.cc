@@ -14,9 +14,7 @@
 namespace {
 
 struct Ring {
-    explicit Ring(uint32_t size) : storage(size) {
-        sys_ringbuffer_init(&rb, storage.data(), size);
-    }
+    explicit Ring(uint32_t size) : storage(size) { sys_ringbuffer_init(&rb, storage.data(), size); }
     ~Ring() { sys_ringbuffer_destroy(&rb); }
     std::vector<uint8_t> peek(int32_t n) {
         std::vector<uint8_t> v(static_cast<size_t>(n));
@@ -56,10 +54,7 @@ TEST(Ring, WritesAndPeeksWrapAroundTheEnd) {
     } cases[] = {
         {6, 5, 3},  // 2 at the end, 3 at the start
         {6, 2, 0},  // ends exactly at the end
-        {0, 7, 7},
-        {7, 1, 0},
-        {7, 7, 6},
-        {3, 4, 7},
+        {0, 7, 7}, {7, 1, 0}, {7, 7, 6}, {3, 4, 7},
     };
     for (const auto& c : cases) {
         SCOPED_TRACE(testing::Message() << "start " << c.start << " len " << c.len);
@@ -142,7 +137,8 @@ TEST(Ring, ProducerAndConsumerPassEveryByteInOrder) {
             const size_t n = std::min<size_t>(1 + rng() % 40, kTotal - sent);
             chunk.resize(n);
             for (size_t i = 0; i < n; ++i) chunk[i] = static_cast<uint8_t>((sent + i) * 31);
-            while (sys_ringbuffer_walloc(&r.rb, static_cast<uint32_t>(n)) < static_cast<int32_t>(n)) {
+            while (sys_ringbuffer_walloc(&r.rb, static_cast<uint32_t>(n)) <
+                   static_cast<int32_t>(n)) {
             }
             sys_ringbuffer_byte_write(&r.rb, chunk.data(), static_cast<uint32_t>(n));
             sent += n;

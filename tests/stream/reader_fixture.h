@@ -43,7 +43,8 @@ inline host::InputOptions options_for(Mode m, int block_size, int ring_size) {
 class Reader {
 public:
     Reader(std::vector<uint8_t> data, const host::InputOptions& o)
-        : data_(std::move(data)), in_(host::RawInput::borrow_memory(data_.data(), data_.size(), o)),
+        : data_(std::move(data)),
+          in_(host::RawInput::borrow_memory(data_.data(), data_.size(), o)),
           ring_size_(o.ring_size) {}
     ~Reader() {
         close();

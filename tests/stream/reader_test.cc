@@ -13,16 +13,8 @@ using namespace readertest;
 
 namespace {
 
-struct Model {
-    const std::vector<uint8_t>& data;
-    uint64_t pos = 0;
-    std::vector<uint8_t> take(uint64_t n) const {
-        if (pos >= data.size()) return {};
-        n = std::min<uint64_t>(n, data.size() - pos);
-        return {data.begin() + static_cast<long>(pos), data.begin() + static_cast<long>(pos + n)};
-    }
-};
-
+// 400 random reads (tiny to several blocks), peeks and seeks of every origin
+// (near the position, often inside the buffer, or anywhere).
 void run_random_ops(Mode mode, uint32_t seed) {
     std::mt19937 rng(seed);
     const size_t size = 3000 + rng() % 60000;
@@ -32,58 +24,48 @@ void run_random_ops(Mode mode, uint32_t seed) {
                                     << " block " << block << " ring " << ring);
     Reader r(pattern(size, seed), options_for(mode, block, ring));
     ASSERT_EQ(r.open(mode), 0);
-    Model m{r.data_};
+    uint64_t pos = 0;
     const bool ringed = mode == Mode::SyncRing || mode == Mode::Thread;
-    const int32_t max_peek = ringed ? ring - block : 3 * block;
+    const uint32_t max_peek = static_cast<uint32_t>(ringed ? ring - block : 3 * block);
     std::vector<uint8_t> buf;
     for (int op = 0; op < 400; ++op) {
         const unsigned kind = rng() % 10;
-        if (kind < 5) {
-            // Reads from tiny to several blocks.
-            const int32_t n = static_cast<int32_t>(rng() % 3 == 0 ? rng() % (3 * block + 5) : rng() % 40);
+        if (kind < 7) {
+            const bool peek = kind >= 5;
+            const int32_t n = static_cast<int32_t>(peek             ? 1 + rng() % max_peek
+                                                   : rng() % 3 == 0 ? rng() % (3 * block + 5)
+                                                                    : rng() % 40);
             buf.assign(static_cast<size_t>(n), 0);
-            const int32_t got = r.read(buf.data(), n);
+            const int32_t got = peek ? r.peek(buf.data(), n) : r.read(buf.data(), n);
             buf.resize(static_cast<size_t>(std::max(got, 0)));
-            const auto want = m.take(static_cast<uint64_t>(n));
-            ASSERT_EQ(buf, want) << "read " << n << " at " << m.pos << " op " << op;
-            m.pos += want.size();
+            const auto want = r.slice(pos, static_cast<size_t>(n));
+            ASSERT_EQ(buf, want) << (peek ? "peek " : "read ") << n << " at " << pos << " op "
+                                 << op;
+            if (!peek) pos += want.size();
             if (n > 0) {
                 ASSERT_EQ(cb_status(&r.cb_),
                           want.size() < static_cast<size_t>(n) ? CB_ERR_EOF : CB_ERR_OK);
             }
-        } else if (kind < 7) {
-            const int32_t n = 1 + static_cast<int32_t>(rng() % static_cast<uint32_t>(max_peek));
-            buf.assign(static_cast<size_t>(n), 0);
-            const int32_t got = r.peek(buf.data(), n);
-            buf.resize(static_cast<size_t>(std::max(got, 0)));
-            const auto want = m.take(static_cast<uint64_t>(n));
-            ASSERT_EQ(buf, want) << "peek " << n << " at " << m.pos << " op " << op;
-            ASSERT_EQ(cb_status(&r.cb_), want.size() < static_cast<size_t>(n) ? CB_ERR_EOF : CB_ERR_OK);
         } else {
-            // Seeks near the position (often inside the buffer) or anywhere.
-            cb_off_t target;
-            if (rng() % 2) {
-                target = static_cast<cb_off_t>(m.pos) + static_cast<cb_off_t>(rng() % (2 * block)) - block / 2;
-            } else {
-                target = static_cast<cb_off_t>(rng() % (size + 100));
-            }
-            if (target < 0) target = 0;
+            cb_off_t target = rng() % 2 ? static_cast<cb_off_t>(pos) +
+                                              static_cast<cb_off_t>(rng() % (2 * block)) - block / 2
+                                        : static_cast<cb_off_t>(rng() % (size + 100));
+            target = std::max<cb_off_t>(target, 0);
             cb_off_t got;
             if (kind == 7) {
                 got = r.seek(target, CB_SEEK_SET);
             } else if (kind == 8) {
-                got = r.seek(target - static_cast<cb_off_t>(m.pos), CB_SEEK_CUR);
-            } else if (mode != Mode::Thread) {
-                // The thread's set has no seek from the end.
+                got = r.seek(target - static_cast<cb_off_t>(pos), CB_SEEK_CUR);
+            } else if (mode != Mode::Thread) {  // the thread's set has no seek from the end
                 target = static_cast<cb_off_t>(size) - static_cast<cb_off_t>(rng() % 100);
                 got = r.seek(target - static_cast<cb_off_t>(size), CB_SEEK_END);
             } else {
                 got = cb_seek_multi(&r.cb_, static_cast<int32_t>(target), CB_SEEK_SET);
             }
             ASSERT_EQ(got, target) << "seek op " << op;
-            m.pos = static_cast<uint64_t>(target);
+            pos = static_cast<uint64_t>(target);
         }
-        ASSERT_EQ(cb_tell64(&r.cb_), m.pos) << "op " << op;
+        ASSERT_EQ(cb_tell64(&r.cb_), pos) << "op " << op;
     }
 }
 
@@ -119,10 +101,11 @@ TEST(ReaderEquivalence, SeeksNeverLetStaleOrMissingBlocksThrough) {
         const unsigned k = rng() % 4;
         if (k == 0) {
             // Outside the buffered bytes: backward, or well beyond the ring.
-            const uint64_t target = rng() % 2 ? rng() % (pos + 1)
-                                              : std::min<uint64_t>(kSize, pos + 200 + rng() % 5000);
+            const uint64_t target =
+                rng() % 2 ? rng() % (pos + 1) : std::min<uint64_t>(kSize, pos + 200 + rng() % 5000);
             const uint64_t seeks = r.in_->counters().seeks;
-            ASSERT_EQ(r.seek(static_cast<cb_off_t>(target), CB_SEEK_SET), static_cast<cb_off_t>(target));
+            ASSERT_EQ(r.seek(static_cast<cb_off_t>(target), CB_SEEK_SET),
+                      static_cast<cb_off_t>(target));
             out_of_buffer += r.in_->counters().seeks != seeks;
             pos = target;
         }
@@ -148,7 +131,7 @@ TEST(ReaderEquivalence, TwoCursorsReadEachByteOnce) {
         Mode mode;
         size_t gap;
     } cases[] = {
-        {Mode::Cache, 3000}, {Mode::Cache, 5000},   {Mode::SyncRing, 3000},
+        {Mode::Cache, 3000},     {Mode::Cache, 5000},  {Mode::SyncRing, 3000},
         {Mode::SyncRing, 14000}, {Mode::Thread, 3000}, {Mode::Thread, 14000},
     };
     for (const auto& c : cases) {
@@ -163,12 +146,14 @@ TEST(ReaderEquivalence, TwoCursorsReadEachByteOnce) {
             // Both cursors move by the same amount, so the gap stays.
             const int32_t n = 1 + static_cast<int32_t>(rng() % 700);
             for (uint64_t& pos : at) {
-                ASSERT_EQ(r.seek(static_cast<cb_off_t>(pos), CB_SEEK_SET), static_cast<cb_off_t>(pos));
+                ASSERT_EQ(r.seek(static_cast<cb_off_t>(pos), CB_SEEK_SET),
+                          static_cast<cb_off_t>(pos));
                 uint8_t head[40];
                 const int32_t p = r.peek(head, 40);
                 ASSERT_EQ(std::vector<uint8_t>(head, head + p), r.slice(pos, 40));
                 const int32_t got = r.read(buf, n);
-                ASSERT_EQ(std::vector<uint8_t>(buf, buf + got), r.slice(pos, static_cast<size_t>(n)));
+                ASSERT_EQ(std::vector<uint8_t>(buf, buf + got),
+                          r.slice(pos, static_cast<size_t>(n)));
                 pos += static_cast<uint64_t>(got);
             }
         }
