@@ -1,5 +1,5 @@
-// The byte ring: capacity, wrap-around, marks, and the wake-ups between one
-// producer and one consumer.
+// The byte ring: wrap-around, the history, in-place commits, and the wake-ups
+// between one producer and one consumer.
 #include <gtest/gtest.h>
 
 #include <atomic>
@@ -14,9 +14,7 @@
 namespace {
 
 struct Ring {
-    explicit Ring(uint32_t size) : storage(size) {
-        sys_ringbuffer_init(&rb, storage.data(), size);
-    }
+    explicit Ring(uint32_t size) : storage(size) { sys_ringbuffer_init(&rb, storage.data(), size); }
     ~Ring() { sys_ringbuffer_destroy(&rb); }
     std::vector<uint8_t> peek(int32_t n) {
         std::vector<uint8_t> v(static_cast<size_t>(n));
@@ -49,17 +47,6 @@ std::vector<uint8_t> seq(uint8_t first, size_t n) {
 
 }  // namespace
 
-TEST(Ring, KeepsOneByteFreeToTellFullFromEmpty) {
-    Ring r(8);
-    EXPECT_EQ(sys_ringbuffer_free(&r.rb), 7);
-    EXPECT_EQ(sys_ringbuffer_avail(&r.rb), 0);
-    EXPECT_EQ(sys_ringbuffer_empty(&r.rb), 1);
-    r.write(seq(1, 7));
-    EXPECT_EQ(sys_ringbuffer_free(&r.rb), 0);
-    EXPECT_EQ(sys_ringbuffer_avail(&r.rb), 7);
-    EXPECT_EQ(r.rb.pkt_cnt, 7u);
-}
-
 TEST(Ring, WritesAndPeeksWrapAroundTheEnd) {
     // (pread/pwrite before, bytes written) -> pwrite after
     const struct {
@@ -67,10 +54,7 @@ TEST(Ring, WritesAndPeeksWrapAroundTheEnd) {
     } cases[] = {
         {6, 5, 3},  // 2 at the end, 3 at the start
         {6, 2, 0},  // ends exactly at the end
-        {0, 7, 7},
-        {7, 1, 0},
-        {7, 7, 6},
-        {3, 4, 7},
+        {0, 7, 7}, {7, 1, 0}, {7, 7, 6}, {3, 4, 7},
     };
     for (const auto& c : cases) {
         SCOPED_TRACE(testing::Message() << "start " << c.start << " len " << c.len);
@@ -89,80 +73,6 @@ TEST(Ring, WritesAndPeeksWrapAroundTheEnd) {
         EXPECT_EQ(r.rb.pread, (c.start + 1) % 8);
         EXPECT_EQ(r.peek(static_cast<int32_t>(c.len - 1)), seq(11, c.len - 1));
     }
-}
-
-TEST(Ring, CopyOutWithSkipCrossesTheEnd) {
-    Ring r(8);
-    r.rb.pread = r.rb.pwrite = 5;
-    r.write(seq(20, 6));  // at 5,6,7,0,1,2
-    uint8_t out[3];
-    EXPECT_EQ(sys_ringbuffer_read_peek(&r.rb, out, 3, 2), 3);  // from index 7
-    EXPECT_EQ(std::vector<uint8_t>(out, out + 3), seq(22, 3));
-    EXPECT_EQ(sys_ringbuffer_read_peek(&r.rb, out, 2, 3), 2);  // from index 0
-    EXPECT_EQ(std::vector<uint8_t>(out, out + 2), seq(23, 2));
-}
-
-TEST(Ring, PeeksNeverExceedWhatIsHeld) {
-    Ring r(16);
-    r.write(seq(1, 5));
-    r.rb.buf_eos = 1;  // a short peek must then not wait
-    EXPECT_EQ(r.peek(10), seq(1, 5));
-    EXPECT_EQ(sys_ringbuffer_byte_read_peek(&r.rb, nullptr, 3), 3);
-    EXPECT_EQ(sys_ringbuffer_byte_read_peek(&r.rb, nullptr, 9), 5);
-    EXPECT_EQ(sys_ringbuffer_byte_read_peek_single_thread(&r.rb, nullptr, 9), 5);
-    EXPECT_EQ(sys_ringbuffer_byte_read_peek_single_thread(&r.rb, nullptr, 2), 2);
-    EXPECT_EQ(r.rb.pread, 0u) << "peeks never consume";
-    EXPECT_EQ(r.rb.rsize_req, 0);
-}
-
-TEST(Ring, DropMarkDiscardsExactlyOneWrite) {
-    Ring r(16);
-    r.rb.rlock = 1;
-    r.rb.wlock = 1;
-    const uint8_t a[4] = {1, 2, 3, 4};
-    EXPECT_EQ(sys_ringbuffer_byte_write(&r.rb, a, 4), 4) << "reported as written";
-    EXPECT_EQ(r.rb.pkt_cnt, 0u);
-    EXPECT_EQ(r.rb.pwrite, 0u);
-    EXPECT_EQ(r.rb.rlock, 0);
-    EXPECT_EQ(r.rb.wlock, 0);
-    r.write(seq(7, 3));
-    EXPECT_EQ(r.peek(3), seq(7, 3));
-}
-
-TEST(Ring, ResetFlushAndCloseClearDifferentThings) {
-    Ring r(16);
-    r.write(seq(1, 5));
-    r.rb.buf_eos = 1;
-    r.rb.slock = 1;
-    r.rb.rlock = 1;
-    r.rb.error = 1;
-    sys_ringbuffer_reset(&r.rb);
-    EXPECT_EQ(r.rb.pkt_cnt, 0u);
-    EXPECT_EQ(r.rb.pread, 0u);
-    EXPECT_EQ(r.rb.pwrite, 0u);
-    EXPECT_EQ(r.rb.buf_eos, 0);
-    EXPECT_EQ(r.rb.slock, 0);
-    EXPECT_EQ(r.rb.rlock, 1) << "reset keeps the drop mark";
-    EXPECT_EQ(r.rb.error, 1) << "reset keeps the flush mark";
-
-    Ring f(16);
-    f.write(seq(1, 5));
-    sys_ringbuffer_flush(&f.rb);
-    EXPECT_EQ(f.rb.pkt_cnt, 0u);
-    EXPECT_EQ(f.rb.pread, 5u);
-    EXPECT_EQ(f.rb.pwrite, 5u);
-    EXPECT_EQ(f.rb.error, 1);
-    EXPECT_EQ(f.rb.buf_eos, 0);
-
-    Ring c(16);
-    c.write(seq(1, 5));
-    c.rb.error = 1;
-    sys_ringbuffer_close(&c.rb);
-    EXPECT_EQ(c.rb.buf_eos, 1);
-    EXPECT_EQ(c.rb.pkt_cnt, 0u);
-    EXPECT_EQ(c.rb.pread, c.rb.pwrite);
-    EXPECT_EQ(c.rb.error, 0);
-    EXPECT_EQ(c.peek(4).size(), 0u) << "a closed ring answers at once";
 }
 
 TEST(Ring, InPlaceCommitMovesTheOverflowToTheStart) {
@@ -227,7 +137,8 @@ TEST(Ring, ProducerAndConsumerPassEveryByteInOrder) {
             const size_t n = std::min<size_t>(1 + rng() % 40, kTotal - sent);
             chunk.resize(n);
             for (size_t i = 0; i < n; ++i) chunk[i] = static_cast<uint8_t>((sent + i) * 31);
-            while (sys_ringbuffer_walloc(&r.rb, static_cast<uint32_t>(n)) < static_cast<int32_t>(n)) {
+            while (sys_ringbuffer_walloc(&r.rb, static_cast<uint32_t>(n)) <
+                   static_cast<int32_t>(n)) {
             }
             sys_ringbuffer_byte_write(&r.rb, chunk.data(), static_cast<uint32_t>(n));
             sent += n;
@@ -248,21 +159,6 @@ TEST(Ring, ProducerAndConsumerPassEveryByteInOrder) {
     producer.join();
     EXPECT_TRUE(ok);
     EXPECT_EQ(sys_ringbuffer_avail(&r.rb), 0);
-}
-
-TEST(Ring, ReadConsumesWhatItCopies) {
-    Ring r(8);
-    r.rb.pread = r.rb.pwrite = 6;
-    r.write(seq(1, 5));
-    uint8_t out[4];
-    EXPECT_EQ(sys_ringbuffer_byte_read(&r.rb, out, 4), 4);
-    EXPECT_EQ(std::vector<uint8_t>(out, out + 4), seq(1, 4));
-    EXPECT_EQ(r.rb.pread, 2u);
-    EXPECT_EQ(r.rb.pkt_cnt, 1u);
-    EXPECT_EQ(r.rb.srlock, 0);
-    r.rb.buf_eos = 1;
-    EXPECT_EQ(sys_ringbuffer_byte_read(&r.rb, nullptr, 4), 1) << "skips what is held";
-    EXPECT_EQ(sys_ringbuffer_empty(&r.rb), 1);
 }
 
 TEST(Ring, HistoryGivesBackReleasedBytesUntilTheProducerNeedsTheirRoom) {

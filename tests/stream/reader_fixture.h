@@ -4,6 +4,7 @@
 
 #include <gtest/gtest.h>
 
+#include <array>
 #include <cstdint>
 #include <memory>
 #include <random>
@@ -26,13 +27,7 @@ inline std::vector<uint8_t> pattern(size_t n, uint32_t seed = 1) {
 enum class Mode { None, Cache, SyncRing, Thread };
 
 inline const char* mode_name(Mode m) {
-    switch (m) {
-        case Mode::None: return "none";
-        case Mode::Cache: return "cache";
-        case Mode::SyncRing: return "sync-ring";
-        case Mode::Thread: return "thread";
-    }
-    return "?";
+    return std::array{"none", "cache", "sync-ring", "thread"}[static_cast<size_t>(m)];
 }
 
 inline host::InputOptions options_for(Mode m, int block_size, int ring_size) {
@@ -48,7 +43,8 @@ inline host::InputOptions options_for(Mode m, int block_size, int ring_size) {
 class Reader {
 public:
     Reader(std::vector<uint8_t> data, const host::InputOptions& o)
-        : data_(std::move(data)), in_(host::RawInput::borrow_memory(data_.data(), data_.size(), o)),
+        : data_(std::move(data)),
+          in_(host::RawInput::borrow_memory(data_.data(), data_.size(), o)),
           ring_size_(o.ring_size) {}
     ~Reader() {
         close();

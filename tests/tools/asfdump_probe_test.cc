@@ -1,7 +1,6 @@
 // asfdump probe through the shared library, as other tools call it: real ASF
 // files answer 1, other containers 0, and the exit status follows the contract.
 #include <gtest/gtest.h>
-
 #include <stdlib.h>
 
 #include <cstdlib>
@@ -34,7 +33,8 @@ TEST(AsfdumpProbe, OtherContainersMadeByFfmpegProbeZero) {
     ASSERT_NE(::mkdtemp(dir), nullptr);
     const std::string d = dir;
     const std::string gen = "ffmpeg -v error -y -f lavfi -i sine=frequency=440:duration=0.3 ";
-    const std::string vgen = "ffmpeg -v error -y -f lavfi -i testsrc=size=64x48:rate=5:duration=0.4 ";
+    const std::string vgen =
+        "ffmpeg -v error -y -f lavfi -i testsrc=size=64x48:rate=5:duration=0.4 ";
     struct Case {
         std::string file;
         std::string cmd;

@@ -1,0 +1,80 @@
+// Plays a real file through the reference host the way the framework drives the
+// descriptor, and keeps what the host saw. Shared by the corpus and HTTP suites.
+#pragma once
+
+#include <gtest/gtest.h>
+
+#include <memory>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include "asf_api.h"
+#include "asf_demuxer.h"
+#include "session.h"
+#include "test_env.h"
+
+namespace corpus {
+
+using host::EventKind;
+using host::HostEvent;
+
+struct Player {
+    explicit Player(std::unique_ptr<host::RawInput> in, bool keep_bytes = false)
+        : s(&hova_asff_demuxer, std::move(in)) {
+        cb().keep_bytes = keep_bytes;
+        rc = s.open();
+    }
+    Player(const std::vector<uint8_t>& f, const host::InputOptions& in = {}, bool keep = false)
+        : Player(host::RawInput::from_memory(f, in), keep) {}
+    host::HostCallbacks& cb() { return s.callbacks(); }
+    asf_demuxer_st* ctx() { return static_cast<asf_demuxer_st*>(s.context()); }
+    std::vector<HostEvent> frames(hova_stream_type_et t) { return cb().commits(t, 0); }
+    bool framed_since(size_t from) {
+        for (size_t i = from; i < cb().events().size(); ++i)
+            if (cb().events()[i].kind == EventKind::Commit && !cb().events()[i].packet_type)
+                return true;
+        return false;
+    }
+    int step() {
+        cb().call = ++calls;
+        hova_stream_type_et t = HOVA_STREAM_NONE;
+        int bs = 0;
+        int64_t pts = 0;
+        return last = hova_asff_demuxer.get_data(s.context(), &t, &bs, &pts);
+    }
+    // get_data until something other than OK or TryAgain (or `max` calls in all).
+    int play(uint64_t max = 1000000) {
+        while (rc == HOVA_OK && calls < max &&
+               (last < 0 || last == HOVA_OK || last == HOVA_TryAgain))
+            step();
+        return last;
+    }
+    int seek(int dir, int64_t* t) { return hova_asff_demuxer.seek_time(s.context(), dir, t, 0); }
+    // Every event as a line, then the last result and the number of calls.
+    std::vector<std::string> trace() {
+        std::vector<std::string> out;
+        for (const HostEvent& e : cb().events()) {
+            std::ostringstream l;
+            l << e.call << ' ' << static_cast<int>(e.kind) << ' ' << e.type << ' ' << e.packet_type
+              << ' ' << e.size << ' ' << e.pts << ' ' << e.crc32;
+            out.push_back(l.str());
+        }
+        out.push_back("last " + std::to_string(last) + " calls " + std::to_string(calls));
+        return out;
+    }
+    // Closed, nothing held by the plug-in, no misuse of the frame buffers.
+    void expect_clean_close() {
+        EXPECT_EQ(s.close(), HOVA_OK);
+        EXPECT_EQ(s.blocks_outstanding(), 0u);
+        EXPECT_EQ(cb().protocol_errors(), 0u);
+    }
+
+    host::Session s;
+    int rc = -1, last = -1;
+    uint64_t calls = 0;
+};
+
+inline std::string base_name(const std::string& p) { return p.substr(p.find_last_of('/') + 1); }
+
+}  // namespace corpus
