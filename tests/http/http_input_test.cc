@@ -102,11 +102,11 @@ TEST(HttpInput, EveryCorpusFileByUrlGivesTheFileEventsInEveryMode) {
         const Played whole = play(by_file(path, with_buffering(host::Buffering::Cache)));
         int64_t last_pts = 0;  // of the last media frame
         for (const std::string& e : whole.events) {
-            int64_t call, kind, type, pt, size, pts;
-            if (std::sscanf(e.c_str(), "%ld %ld %ld %ld %ld %ld", &call, &kind, &type, &pt, &size,
-                            &pts) == 6 &&
+            long long call, kind, type, pt, size, pts;
+            if (std::sscanf(e.c_str(), "%lld %lld %lld %lld %lld %lld", &call, &kind, &type,
+                            &pt, &size, &pts) == 6 &&
                 kind == 0 && pt == 0)
-                last_pts = std::max(last_pts, pts);
+                last_pts = std::max<int64_t>(last_pts, pts);
         }
         for (host::Buffering b : kBufferings) {
             SCOPED_TRACE(base_name(path) + " " + host::buffering_name(b));
