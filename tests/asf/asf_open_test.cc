@@ -184,4 +184,70 @@ TEST(Open, HostileSizeFieldsNeverOpenOrLeak) {
     }
 }
 
+// More streams than the context has records: the last of each kind is kept.
+struct Layout {
+    const char* what;
+    int records;                   // stream records the host buffer holds
+    std::vector<Bytes> top;        // top-level streams in header order
+    std::vector<Bytes> hidden;     // streams inside the header extension (after `top`)
+    int rc;
+    std::vector<int> kept;         // stream numbers of the records, in order
+    int active_audio, active_video;  // stream numbers; 0 for none
+};
+
+TEST(StreamProps, MoreStreamsThanRecordsKeepTheLastOfEachKind) {
+    using asfb::audio_stream;
+    using asfb::video_stream;
+    const Layout cases[] = {
+        {"two audio languages and video, one audio hidden", 2,
+         {audio_stream(1), video_stream(2)}, {audio_stream(3)}, HOVA_OK, {2, 3}, 3, 2},
+        {"two audio before video", 2, {audio_stream(1), audio_stream(2), video_stream(3)}, {},
+         HOVA_OK, {2, 3}, 2, 3},
+        {"video first, then three audio", 2,
+         {video_stream(1), audio_stream(2), audio_stream(3), audio_stream(4)}, {}, HOVA_OK,
+         {1, 4}, 4, 1},
+        {"two video", 2, {audio_stream(1), video_stream(2), video_stream(3)}, {}, HOVA_OK,
+         {1, 3}, 1, 3},
+        {"a larger buffer keeps every stream", 3,
+         {audio_stream(1), video_stream(2), audio_stream(3)}, {}, HOVA_OK, {1, 2, 3}, 3, 2},
+        {"a larger buffer, one record too few", 3,
+         {audio_stream(1), audio_stream(2), audio_stream(3), video_stream(4)}, {}, HOVA_OK,
+         {2, 3, 4}, 3, 4},
+        {"one record, audio only", 1, {audio_stream(1), audio_stream(2)}, {}, HOVA_OK, {2}, 2, 0},
+        {"one record cannot hold audio and video", 1, {audio_stream(1), video_stream(2)}, {},
+         HOVA_NotEnoughMemory, {}, 0, 0},
+        {"no record at all", 0, {audio_stream(1)}, {}, HOVA_NotEnoughMemory, {}, 0, 0},
+    };
+    for (const Layout& c : cases) {
+        SCOPED_TRACE(c.what);
+        std::vector<Bytes> children = c.top;
+        if (!c.hidden.empty()) children.push_back(asfb::header_extension(c.hidden));
+        host::SessionOptions so;
+        so.context_size = static_cast<int>(sizeof(asf_demuxer_st) + 8 +
+                                           c.records * sizeof(asf_stream_st));
+        so.misalign = 1;  // the context starts 7 bytes in: exactly `records` fit
+        Opened o = testsupport::open_file(file_with(children), so);
+        ASSERT_EQ(o.rc, c.rc) << host::errno_name(o.rc);
+        if (o.rc == HOVA_OK) {
+            asf_demuxer_st* d = o.ctx();
+            EXPECT_EQ(d->max_streams, c.records);
+            ASSERT_EQ(d->s.total_streams, static_cast<int>(c.kept.size()));
+            int audio = 0, video = 0;
+            for (int i = 0; i < d->s.total_streams; ++i) {
+                EXPECT_EQ(d->stream_info[i].stream_num, c.kept[i]) << "record " << i;
+                (d->stream_info[i].s.stream_type == HOVA_STREAM_AUDIO ? audio : video)++;
+            }
+            EXPECT_EQ(d->s.num_streams[AUD], audio);
+            EXPECT_EQ(d->s.num_streams[VID], video);
+            auto num_of = [&](int k) {
+                const int a = d->s.active_stream[k];
+                return a < 0 ? 0 : d->stream_info[a].stream_num;
+            };
+            EXPECT_EQ(num_of(AUD), c.active_audio);
+            EXPECT_EQ(num_of(VID), c.active_video);
+        }
+        EXPECT_TRUE(o.close_clean()) << "a replaced record's configuration block leaked";
+    }
+}
+
 }  // namespace
