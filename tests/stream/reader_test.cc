@@ -181,3 +181,32 @@ TEST(ReaderClose, EndsTheThreadWaitingForRoomOrStalledInARead) {
         }
     }
 }
+
+TEST(ReaderSetup, RefusesARingSmallerThanABlockAndAnswersItsQueries) {
+    // A ring must take a block with its one byte of slack.
+    for (int ring : {0, 64, 65}) {
+        Reader r(pattern(1000), options_for(Mode::SyncRing, 64, ring));
+        EXPECT_EQ(r.open(Mode::SyncRing), ring > 64 ? 0 : -1) << "ring " << ring;
+    }
+    for (Mode mode : {Mode::Cache, Mode::SyncRing}) {
+        Reader r(pattern(5000), options_for(mode, 256, 1024));
+        ASSERT_EQ(r.open(mode), 0);
+        EXPECT_EQ(cb_get_file_size(&r.cb), 5000u);
+        ASSERT_EQ(r.take(100), r.slice(0, 100));
+        // Inside the buffer from either origin; never from the end.
+        EXPECT_EQ(seek_out_of_buffer(&r.cb, 50, CB_SEEK_SET), 0);
+        EXPECT_EQ(seek_out_of_buffer(&r.cb, -10, CB_SEEK_CUR), 0);
+        EXPECT_EQ(seek_out_of_buffer(&r.cb, 0, CB_SEEK_END), 1);
+        EXPECT_EQ(seek_out_of_buffer(&r.cb, 4900, CB_SEEK_SET), 1);
+        // Buffering switched off then on again loses no byte.
+        for (int enable : {0, 1}) {
+            EXPECT_EQ(cb_set_buffer_mode(&r.cb, enable), 0);
+            EXPECT_EQ(r.take(300), r.slice(enable ? 400 : 100, 300));
+        }
+    }
+    auto es = options_for(Mode::None, 256, 0);
+    es.rbuf_mode = CBIO_APPLY_ES_BUF;
+    Reader r(pattern(1000), es);
+    ASSERT_EQ(r.open(), 0);
+    EXPECT_EQ(cb_set_buffer_mode(&r.cb, 1), 0) << "elementary streams stay unbuffered";
+}
