@@ -74,7 +74,9 @@ TEST(Ring, AWaitingProducerWakesWhenItsRoomIsFreeOrTheRingIsFlushedOrClosed) {
         EXPECT_EQ(result.load(), c.result);
         EXPECT_EQ(r.rb.wsize_req, 0);
         EXPECT_EQ(sys_ringbuffer_avail(&r.rb), c.action == Release ? 1 : 0);
-        if (c.action == Close) EXPECT_TRUE(r.peek(4).empty()) << "a closed ring gives no more";
+        if (c.action == Close) {
+            EXPECT_TRUE(r.peek(4).empty()) << "a closed ring gives no more";
+        }
         EXPECT_EQ(r.rb.error, 0) << "the producer consumed the flush mark";
     }
 }
