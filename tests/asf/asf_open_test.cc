@@ -140,6 +140,16 @@ TEST(Open, RichFileFillsEveryRecord) {
 // Size fields that break naive arithmetic, on every object the walk reads,
 // in a header of its own size and in an endless one: a size below the
 // object's header never opens, one above the real size never opens.
+TEST(Open, ObjectOfSizeZeroBehindTheDataEndsTheSearchForTheIndex) {
+    asfb::File f = rich_file();
+    f.trailing = {asfb::object(asfb::guid_from_text("D6E229D3-35DA-11D1-9034-00A0C90349BE"),
+                               Bytes(30, 0), 0),
+                  asfb::simple_index(5000000, {{0, 1}, {1, 1}, {2, 1}})};
+    Opened o = testsupport::open_bytes(asfb::build(f));
+    ASSERT_EQ(o.rc, HOVA_OK);
+    EXPECT_EQ(o.ctx()->index_count, 0u) << "the index behind it is out of reach";
+}
+
 TEST(Open, HostileSizeFieldsNeverOpenOrLeak) {
     const uint64_t sizes[] = {0, 1, 23, 24, 25, 45, (1ull << 32) - 1, 1ull << 32,
                               (1ull << 32) + 24, 1ull << 63, ~0ull - 23, ~0ull};
