@@ -66,20 +66,8 @@ int32_t cb_read_multi(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
     sys_ringbuffer* rb = cb->active_rbuf;
     if (!rb) return cb_read_single(cb, dst, size);
     if (size <= 0) return 0;
-    if (side_active(cb)) {
-        bool more = false;
-        const int32_t n = side_read(cb, dst, size, &more);
-        cb->cb_errcode = n < size ? CB_ERR_EOF : CB_ERR_OK;
-        if (!more) return n;
-        return n + cb_read_multi(cb, dst ? dst + n : nullptr, size - n);
-    }
-    // Held already: no lock and no hand-over (the release comes later, in a
-    // batch, and before any wait).
-    if (!rb_paused(rb) && sys_ringbuffer_take_held(rb, dst, static_cast<uint32_t>(size)) == size) {
-        cb->curpos += static_cast<cb_fpos>(size);
-        cb->cb_errcode = CB_ERR_OK;
-        return size;
-    }
+    const int32_t quick = ring_read_quick(cb, dst, size, cb_read_multi);
+    if (quick >= 0) return quick;
     // Requests beyond the ring's capacity are served in pieces that fit.
     const int32_t cap = ring_capacity(cb);
     int32_t total = 0;

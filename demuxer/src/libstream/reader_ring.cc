@@ -45,19 +45,8 @@ void WriteData(cb_buffer_st* cb, uint32_t wanted) {
 int32_t read_rbuf_data(cb_buffer_st* cb, uint8_t* dst, int32_t size) {
     sys_ringbuffer* rb = cb->active_rbuf;
     if (size <= 0) return 0;
-    if (side_active(cb)) {
-        bool more = false;
-        const int32_t n = side_read(cb, dst, size, &more);
-        cb->cb_errcode = n < size ? CB_ERR_EOF : CB_ERR_OK;
-        if (!more) return n;
-        return n + read_rbuf_data(cb, dst ? dst + n : nullptr, size - n);
-    }
-    // Held already: no lock (the release comes later, in a batch).
-    if (!rb_paused(rb) && sys_ringbuffer_take_held(rb, dst, static_cast<uint32_t>(size)) == size) {
-        cb->curpos += static_cast<cb_fpos>(size);
-        cb->cb_errcode = CB_ERR_OK;
-        return size;
-    }
+    const int32_t quick = ring_read_quick(cb, dst, size, read_rbuf_data);
+    if (quick >= 0) return quick;
     sys_ringbuffer_settle(rb);
     int32_t total = 0;
     while (total < size) {

@@ -17,6 +17,27 @@ uint8_t* side_memory(const cb_buffer_st* cb) { return cb->base + CB_CACHE_HEAD; 
 
 cb_fpos side_end(const ring_side_st* s) { return s->side_pos + s->side_len; }
 
+// Locks the ring and settles it, so that what it holds is final, and gives
+// the position of the ring's first byte (kept aside while a visit is out).
+cb_fpos lock_for_visit(cb_buffer_st* cb) {
+    const ring_side_st* s = ring_side(cb);
+    const cb_fpos ring_pos = s->active ? s->ring_pos : cb->curpos;
+    pthread_mutex_lock(&cb->active_rbuf->ring_mutex);
+    sys_ringbuffer_settle_locked(cb->active_rbuf);
+    return ring_pos;
+}
+
+// The reader stands at `pos` in a visit; the side block holds `len` bytes
+// read there (`valid`), or nothing was read (an empty visit).
+void enter_visit(cb_buffer_st* cb, cb_fpos pos, uint32_t len, int valid) {
+    ring_side_st* s = ring_side(cb);
+    s->active = 1;
+    s->valid = valid;
+    s->side_pos = pos;
+    s->side_len = len;
+    cb->curpos = pos;
+}
+
 // Reads a block at `target` into the side block; the input goes back to the
 // end of what the ring holds. -1 (nothing changed) when the input refuses
 // to go to `target`.
@@ -24,10 +45,8 @@ cb_off_t fetch_side(cb_buffer_st* cb, cb_fpos target) {
     ring_side_st* s = ring_side(cb);
     sys_ringbuffer* rb = cb->active_rbuf;
     cb_io_st* in = cb->input;
-    const cb_fpos ring_pos = s->active ? s->ring_pos : cb->curpos;
-    pthread_mutex_lock(&rb->ring_mutex);
     // The way back below is the end of what the ring holds.
-    sys_ringbuffer_settle_locked(rb);
+    const cb_fpos ring_pos = lock_for_visit(cb);
     if (in->seek(in, static_cast<cb_off_t>(target), CB_SEEK_SET) == -1) {
         pthread_mutex_unlock(&rb->ring_mutex);
         return -1;
@@ -50,11 +69,7 @@ cb_off_t fetch_side(cb_buffer_st* cb, cb_fpos target) {
         s->hold_ahead = 1;
     }
     pthread_mutex_unlock(&rb->ring_mutex);
-    s->active = 1;
-    s->valid = 1;
-    s->side_pos = target;
-    s->side_len = static_cast<uint32_t>(n);
-    cb->curpos = target;
+    enter_visit(cb, target, static_cast<uint32_t>(n), 1);
     return static_cast<cb_off_t>(target);
 }
 
@@ -79,9 +94,7 @@ cb_off_t ring_seek_end(cb_buffer_st* cb, cb_off_t offset) {
     ring_side_st* s = ring_side(cb);
     sys_ringbuffer* rb = cb->active_rbuf;
     cb_io_st* in = cb->input;
-    const cb_fpos ring_pos = s->active ? s->ring_pos : cb->curpos;
-    pthread_mutex_lock(&rb->ring_mutex);
-    sys_ringbuffer_settle_locked(rb);
+    const cb_fpos ring_pos = lock_for_visit(cb);
     const cb_off_t r = in->seek(in, offset, CB_SEEK_END);
     if (r != -1 && !s->input_away) {
         // The input stays there until the ring reads again (WriteData).
@@ -92,11 +105,7 @@ cb_off_t ring_seek_end(cb_buffer_st* cb, cb_off_t offset) {
     if (r == -1) return -1;
     // An empty visit: a read there moves the ring, a seek back finds it.
     s->ring_pos = ring_pos;
-    s->active = 1;
-    s->valid = 0;
-    s->side_pos = static_cast<cb_fpos>(r);
-    s->side_len = 0;
-    cb->curpos = static_cast<cb_fpos>(r);
+    enter_visit(cb, static_cast<cb_fpos>(r), 0, 0);
     return r;
 }
 
@@ -214,4 +223,24 @@ cb_off_t ring_seek_to(cb_buffer_st* cb, cb_off_t target) {
         cb->curpos = was;
     }
     return fetch_side(cb, t);
+}
+
+int32_t ring_read_quick(cb_buffer_st* cb, uint8_t* dst, int32_t size,
+                        int32_t (*rest)(cb_buffer_st*, uint8_t*, int32_t)) {
+    if (side_active(cb)) {
+        bool more = false;
+        const int32_t n = side_read(cb, dst, size, &more);
+        cb->cb_errcode = n < size ? CB_ERR_EOF : CB_ERR_OK;
+        if (!more) return n;
+        return n + rest(cb, dst ? dst + n : nullptr, size - n);
+    }
+    // Held already: no lock and no hand-over (the release comes later, in a
+    // batch, and before any wait).
+    sys_ringbuffer* rb = cb->active_rbuf;
+    if (!rb_paused(rb) && sys_ringbuffer_take_held(rb, dst, static_cast<uint32_t>(size)) == size) {
+        cb->curpos += static_cast<cb_fpos>(size);
+        cb->cb_errcode = CB_ERR_OK;
+        return size;
+    }
+    return -1;
 }

@@ -107,6 +107,11 @@ int32_t side_read(cb_buffer_st* cb, uint8_t* dst, int32_t size, bool* more);
 // Serves a peek from the side block (read again at curpos when it falls
 // short); *use_ring when the ring now stands at curpos and serves it.
 int32_t side_peek(cb_buffer_st* cb, uint8_t* dst, int32_t size, bool* use_ring);
+// A read served without the ring's lock: from the side block of a visit (and
+// on through `rest` past its end), or wholly from what the ring holds. -1 when
+// neither applies and the caller reads from the ring.
+int32_t ring_read_quick(cb_buffer_st* cb, uint8_t* dst, int32_t size,
+                        int32_t (*rest)(cb_buffer_st*, uint8_t*, int32_t));
 // Seek of a ring-buffered reader, either set: inside the ring, its history,
 // the side block, or a visit elsewhere. The new position or -1.
 cb_off_t ring_seek_to(cb_buffer_st* cb, cb_off_t target);
