@@ -166,9 +166,10 @@ inline void expect_frames(const Player& pl, const std::vector<Want>& want) {
         const auto got = pl.frames(s == 1 ? HOVA_STREAM_AUDIO : HOVA_STREAM_VIDEO);
         ASSERT_EQ(got.size(), own.size()) << "stream " << int(s);
         for (size_t i = 0; i < got.size(); ++i) {
-            EXPECT_EQ(got[i].pts, own[i]->pts) << "stream " << int(s) << " frame " << i;
-            EXPECT_EQ(got[i].size, int(own[i]->data.size())) << "stream " << int(s) << " frame " << i;
-            EXPECT_EQ(got[i].crc32, crc(own[i]->data)) << "stream " << int(s) << " frame " << i;
+            SCOPED_TRACE(testing::Message() << "stream " << int(s) << " frame " << i);
+            EXPECT_EQ(got[i].pts, own[i]->pts);
+            EXPECT_EQ(got[i].size, int(own[i]->data.size()));
+            EXPECT_EQ(got[i].crc32, crc(own[i]->data));
         }
     }
 }
