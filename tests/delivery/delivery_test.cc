@@ -36,6 +36,28 @@ Bytes chunks(std::initializer_list<int> order) {
     return out;
 }
 
+// Switches `off` off after `at` calls (-1: at the first packet abandoned),
+// where only switching off is accepted; the host forgets what it had of it.
+void switch_off(Player& p, hova_stream_type_et off, int at) {
+    for (int i = 0, rc = 0; at < 0 ? rc == HOVA_OK : i < at; ++i) rc = p.step();
+    const struct { hova_stream_type_et type; int index, result; } calls[] = {
+        {HOVA_STREAM_PROG, 1, HOVA_InvalidParam}, {HOVA_STREAM_AUDIO, 0, HOVA_InvalidParam},
+        {HOVA_STREAM_VIDEO, 1, HOVA_InvalidParam}, {HOVA_STREAM_NONE, -1, HOVA_InvalidParam},
+        {HOVA_STREAM_CLIP, -1, HOVA_InvalidParam}, {HOVA_STREAM_PROG, 0, HOVA_OK},
+        {HOVA_STREAM_SUBTITLE, -1, HOVA_OK}, {off, -1, HOVA_OK}, {off, -1, HOVA_OK}};
+    for (const auto& c : calls)
+        EXPECT_EQ(hova_asff_demuxer.set_track(p.ctx(), c.type, c.index, 1, HOVA_INPUT_MASTER),
+                  c.result) << c.type << " " << c.index;
+    const int* active = p.ctx()->s.active_stream;
+    EXPECT_EQ(active[AUD] < 0, off == HOVA_STREAM_AUDIO);
+    EXPECT_EQ(active[VID] < 0, off == HOVA_STREAM_VIDEO);
+    auto& ev = p.host.events();
+    ev.erase(std::remove_if(ev.begin(), ev.end(), [&](auto& e) { return e.type == off; }),
+             ev.end());
+    EXPECT_EQ(p.ctx()->parse_mode, PARSE_SEQ);
+    EXPECT_EQ(p.ctx()->accept_stream_type, HOVA_STREAM_NONE);
+}
+
 struct Shape {
     std::string what;
     Bytes file;
@@ -251,18 +273,7 @@ std::vector<Shape> shapes() {
         for (int at : {0, 3, 40, -1})  // -1: at the abandoned packet
             s.push_back({"track off", av_file(at < 0 ? broken : asfb::mux(many, 1024)), want,
                          -(at < 0), 0, off == HOVA_STREAM_AUDIO ? 2 : 1,
-                         [off, at](Player& p) {
-                             for (int i = 0, rc = 0; at < 0 ? rc == HOVA_OK : i < at; ++i)
-                                 rc = p.step();
-                             ASSERT_EQ(hova_asff_demuxer.set_track(p.ctx(), off, -1, 0,
-                                                                   HOVA_INPUT_MASTER), 0);
-                             auto& ev = p.host.events();
-                             ev.erase(std::remove_if(ev.begin(), ev.end(),
-                                                     [&](auto& e) { return e.type == off; }),
-                                      ev.end());
-                             EXPECT_EQ(p.ctx()->parse_mode, PARSE_SEQ);
-                             EXPECT_EQ(p.ctx()->accept_stream_type, HOVA_STREAM_NONE);
-                         }});
+                         [off, at](Player& p) { switch_off(p, off, at); }});
     }
     return s;
 }
@@ -302,29 +313,6 @@ TEST(Delivery, EveryShapeGivesItsFramesInEveryBufferingMode) {
             }
             pl.expect_clean_close();
         }
-    }
-}
-
-TEST(Track, OnlySwitchingOffIsAccepted) {
-    const struct { hova_stream_type_et type; int index, result, off; } rows[] = {
-        {HOVA_STREAM_PROG, 0, HOVA_OK, -1}, {HOVA_STREAM_PROG, 1, HOVA_InvalidParam, -1},
-        {HOVA_STREAM_AUDIO, 0, HOVA_InvalidParam, -1}, {HOVA_STREAM_AUDIO, -1, HOVA_OK, AUD},
-        {HOVA_STREAM_VIDEO, 1, HOVA_InvalidParam, -1}, {HOVA_STREAM_VIDEO, -1, HOVA_OK, VID},
-        {HOVA_STREAM_SUBTITLE, -1, HOVA_OK, SUB}, {HOVA_STREAM_NONE, -1, HOVA_InvalidParam, -1},
-        {HOVA_STREAM_CLIP, -1, HOVA_InvalidParam, -1}};
-    for (const auto& r : rows) {
-        SCOPED_TRACE(testing::Message() << r.type << " " << r.index);
-        Player pl(av_file(asfb::mux(skewed(2, 0, 0), 1024)));
-        pl.open_or_fail();
-        int* active = pl.ctx()->s.active_stream;
-        active[SUB] = 5;  // a subtitle track pretended active
-        const int before[3] = {active[0], active[1], active[2]};
-        for (int twice = 0; twice < 2; ++twice)
-            EXPECT_EQ(hova_asff_demuxer.set_track(pl.ctx(), r.type, r.index, 1, HOVA_INPUT_MASTER),
-                      r.result);
-        for (int k = 0; k < 3; ++k) EXPECT_EQ(active[k], k == r.off ? -1 : before[k]) << k;
-        active[SUB] = -1;
-        pl.expect_clean_close();
     }
 }
 
