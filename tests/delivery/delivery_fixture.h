@@ -27,16 +27,13 @@ class Player {
 public:
     explicit Player(Bytes file, const host::InputOptions& in = {}, int ring_size = 1 << 20)
         : input_(host::RawInput::from_memory(std::move(file), in)),
-          buffer_(static_cast<size_t>(hova_asff_demuxer.min_context_size), 0),
-          ring_size_(ring_size) {
-        table_ = *host.table();
-        table_.stream_alloc = &shim<0>;
-        table_.stream_realloc = &shim<1>;
-        current() = this;
+          buffer_(size_t(hova_asff_demuxer.min_context_size), 0), ring_size_(ring_size) {
+        table_ = *host.table(), table_.stream_alloc = &shim<0>, table_.stream_realloc = &shim<1>;
+        current_ = this;
     }
     ~Player() {
         close();
-        if (current() == this) current() = nullptr;
+        if (current_ == this) current_ = nullptr;
     }
     // The Nth stream_alloc (stream_realloc) from now on is refused (0: none).
     void refuse_alloc_at(uint64_t n) { refuse_at_[0] = n ? alloc_calls + n : 0; }
@@ -52,8 +49,7 @@ public:
     void open_or_fail() { ASSERT_EQ(open(), HOVA_OK); }
     // One get_data call; `last_type` as the plug-in left it (NONE when untouched).
     int step() {
-        host.call++;
-        last_type = HOVA_STREAM_NONE;
+        host.call++, last_type = HOVA_STREAM_NONE;
         int bufsize = -7;
         int64_t pts = -7;
         results.push_back(hova_asff_demuxer.get_data(ctx_, &last_type, &bufsize, &pts));
@@ -96,13 +92,10 @@ public:
     std::vector<int> results;
 
 private:
-    static Player*& current() {
-        static Player* p = nullptr;
-        return p;
-    }
+    static inline Player* current_ = nullptr;  // the one whose frame buffers are asked for
     template <int Realloc>
     static int shim(void* c, hova_stream_type_et t, void** buffer, int size) {
-        Player* p = current();
+        Player* p = current_;
         if (++(Realloc ? p->realloc_calls : p->alloc_calls) == p->refuse_at_[Realloc])
             return *buffer = nullptr, -1;
         const hova_callback_st* h = p->host.table();
@@ -121,9 +114,7 @@ private:
 inline Bytes av_file(std::vector<Bytes> packets, uint32_t packet_size = 1024,
                      uint64_t preroll_ms = 0) {
     asfb::PacketFile f;
-    f.packet_size = packet_size;
-    f.preroll_ms = preroll_ms;
-    f.packets = std::move(packets);
+    f.packet_size = packet_size, f.preroll_ms = preroll_ms, f.packets = std::move(packets);
     return asfb::build_packet_file(f);
 }
 
@@ -141,11 +132,7 @@ inline std::vector<asfb::Object> skewed(uint32_t n, uint32_t a, uint32_t v,
 }
 
 // A frame the host must receive: stream 1 audio, 2 video; time in microseconds.
-struct Want {
-    uint8_t stream;
-    int64_t pts;
-    Bytes data;
-};
+struct Want { uint8_t stream; int64_t pts; Bytes data; };
 // Each stream's objects but its last (which stays pending at the end), shifted by `ms`.
 inline std::vector<Want> all_but_last(const std::vector<asfb::Object>& objs, int64_t ms = 0) {
     std::vector<Want> out;

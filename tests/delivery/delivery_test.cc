@@ -20,13 +20,10 @@ using asfb::pattern;
 using Tweak = std::function<void(asfb::PacketFile&)>;
 
 Bytes one(const asfb::Payload& p, uint32_t size) { return packet({p}, size); }
-Bytes cut(const Bytes& b, size_t from, size_t to) {
-    return Bytes(b.begin() + from, b.begin() + to);
-}
+Bytes cut(const Bytes& b, size_t i, size_t j) { return Bytes(b.begin() + i, b.begin() + j); }
 Bytes pfile(std::vector<Bytes> packets, uint32_t size, const Tweak& tweak) {
     asfb::PacketFile f;
-    f.packet_size = size;
-    f.packets = std::move(packets);
+    f.packet_size = size, f.packets = std::move(packets);
     tweak(f);
     return asfb::build_packet_file(f);
 }

@@ -49,12 +49,11 @@ Use session(const Bytes& file, host::Buffering b, const std::function<void(Playe
                 EXPECT_TRUE(in(rc = p.step(), {HOVA_OK, HOVA_TryAgain, HOVA_EndOfStream,
                                                HOVA_NotEnoughMemory})) << rc;
         };
-        deliver(30);
-        int64_t pts = duration / 2;
-        EXPECT_TRUE(in(d.seek_time(ctx, HOVA_SEEK_FORWARD, &pts, 0), {HOVA_OK, HOVA_SeekFailed}));
-        deliver(30);
-        pts = duration / 4;
-        EXPECT_TRUE(in(d.seek_time(ctx, HOVA_SEEK_BACKWARD, &pts, 0), {HOVA_OK, HOVA_SeekFailed}));
+        for (auto [dir, part] : {std::pair{HOVA_SEEK_FORWARD, 2}, {HOVA_SEEK_BACKWARD, 4}}) {
+            deliver(30);
+            int64_t pts = duration / part;
+            EXPECT_TRUE(in(d.seek_time(ctx, dir, &pts, 0), {HOVA_OK, HOVA_SeekFailed}));
+        }
         EXPECT_EQ(d.resync_time(ctx, 0), HOVA_OK);
         deliver(20000);
     }
@@ -139,17 +138,11 @@ TEST(FaultSweep, EveryFaultAtEveryUseThroughAWholeSession) {
                                                     << total);
                     const Bytes cut(file.begin(), file.begin() + long(k.cut ? n - 1 : 0));
                     const Use u = session(k.cut ? cut : file, b, [&](Player& p) { k.arm(p, n); });
-                    if (!k.stride && n <= clean.header) {
-                        EXPECT_TRUE(u.frames.empty());
-                    }
                     size_t known = 0;
                     for (const auto& f : u.frames) known += clean.frames.count(f) > 0;
-                    if (k.frames) {
-                        EXPECT_EQ(known, u.frames.size());
-                    }
-                    if (k.frames == 2) {
-                        EXPECT_GE(u.frames.size() + 1, clean.frames.size());
-                    }
+                    EXPECT_TRUE(k.stride || n > clean.header || u.frames.empty());
+                    EXPECT_TRUE(!k.frames || known == u.frames.size()) << known;
+                    EXPECT_TRUE(k.frames < 2 || u.frames.size() + 1 >= clean.frames.size());
                 }
             }
         }
