@@ -1,28 +1,70 @@
-// Fault sweeps over whole sessions (open, queries, delivery, seeks, resync,
-// close) in every buffering mode, on built and real files. Each sweep first
-// runs the session clean to count how often the host's service is used, then
-// arms the fault at each of those uses in turn. Whatever fails, every call
-// gives a result its entry point may give, the frame callbacks are used by
-// the rules, and the host holds nothing after close.
-//
-// Already swept elsewhere, and not repeated here: the data cut and each
-// stream_alloc refused with the default buffering (tests/delivery).
-#include <gtest/gtest.h>
+// Fault sweeps over whole sessions (open, queries, deliveries, a seek forward
+// and back, a resync, delivery to the end, close) in every buffering mode, on
+// a built file and real ones. Each sweep runs the session clean to count how
+// often the faulted service is used, then arms the fault at each use in turn.
+// Whatever fails, every call gives a result its entry point may give, the
+// frame callbacks are used by the rules and the host holds nothing after
+// close; a refused frame buffer costs one frame at most, and memory faults
+// never bring a frame the clean session did not have.
+#include <functional>
+#include <set>
 
-#include <algorithm>
-#include <string>
-#include <vector>
-
-#include "asf_packets.h"
-#include "fault_session.h"
+#include "../delivery/delivery_fixture.h"
 #include "test_env.h"
 
 namespace {
 
-using namespace faults;
+using namespace delivery;
+using Frames = std::multiset<std::pair<int64_t, uint32_t>>;
 
-constexpr Buffering kAllModes[] = {Buffering::Cache, Buffering::None, Buffering::Ring,
-                                   Buffering::RingThread};
+bool in(int rc, std::initializer_list<int> ok) {
+    return std::find(ok.begin(), ok.end(), rc) != ok.end();
+}
+
+struct Use {
+    uint64_t mallocs = 0, allocs = 0, reallocs = 0, seeks = 0, reads = 0, header = 0, size = 0;
+    Frames frames;
+};
+
+Use session(const Bytes& file, host::Buffering b, const std::function<void(Player&)>& arm) {
+    Player p(file, host::with_buffering(b), 65536);
+    arm(p);
+    Use u;
+    const int orc = p.open();
+    EXPECT_TRUE(in(orc, {HOVA_OK, HOVA_NotEnoughMemory, HOVA_OpenFailed, HOVA_EndOfStream})) << orc;
+    if (orc == HOVA_OK) {
+        const hova_dmx_func_st& d = hova_asff_demuxer;
+        void* ctx = p.ctx();
+        u.header = p.ctx()->first_packet;
+        hova_program_info_st prog{};
+        hova_audio_info_st audio{};
+        hova_video_info_st video{};
+        EXPECT_EQ(d.get_info(ctx, HOVA_STREAM_PROG, 0, &prog), HOVA_OK);
+        const std::initializer_list<int> maybe = {HOVA_OK, HOVA_InvalidParam};
+        EXPECT_TRUE(in(d.get_info(ctx, HOVA_STREAM_AUDIO, 0, &audio), maybe));
+        EXPECT_TRUE(in(d.get_info(ctx, HOVA_STREAM_VIDEO, 0, &video), maybe));
+        const int64_t duration = prog.duration > 0 ? prog.duration : 4000000;
+        auto deliver = [&](int n) {
+            for (int i = 0, rc = HOVA_OK; i < n && rc != HOVA_EndOfStream; ++i)
+                EXPECT_TRUE(in(rc = p.step(), {HOVA_OK, HOVA_TryAgain, HOVA_EndOfStream,
+                                               HOVA_NotEnoughMemory})) << rc;
+        };
+        for (auto [dir, part] : {std::pair{HOVA_SEEK_FORWARD, 2}, {HOVA_SEEK_BACKWARD, 4}}) {
+            deliver(30);
+            int64_t pts = duration / part;
+            EXPECT_TRUE(in(d.seek_time(ctx, dir, &pts, 0), {HOVA_OK, HOVA_SeekFailed}));
+        }
+        EXPECT_EQ(d.resync_time(ctx, 0), HOVA_OK);
+        deliver(20000);
+    }
+    p.expect_clean_close();
+    for (auto t : {HOVA_STREAM_AUDIO, HOVA_STREAM_VIDEO})
+        for (const auto& e : p.frames(t)) u.frames.insert({e.pts, e.crc32});
+    u.mallocs = p.host.malloc_calls(), u.allocs = p.alloc_calls, u.reallocs = p.realloc_calls;
+    u.seeks = p.input().counters().seeks, u.reads = p.input().counters().reads;
+    u.size = file.size();
+    return u;
+}
 
 // Audio and video with an index, objects split over packets, a compressed
 // payload: every path of open, delivery and both seek methods is reached.
@@ -33,114 +75,87 @@ Bytes built_file() {
         objs.push_back({2, 2040 + 100 * i, asfb::pattern(1300 + 97 * i, 50 + i), i % 4 == 0});
     }
     asfb::PacketFile pf;
-    pf.packet_size = 800;
-    pf.preroll_ms = 2000;
+    pf.packet_size = 800, pf.preroll_ms = 2000;
     pf.packets = asfb::mux(objs, pf.packet_size);
     pf.packets.push_back(asfb::packet(
         {asfb::compressed(1, 40, 3700, 20, {asfb::pattern(30, 1), asfb::pattern(40, 2)})}, 800));
-    const uint32_t n = static_cast<uint32_t>(pf.packets.size());
+    const uint32_t n = uint32_t(pf.packets.size());
     pf.trailing = {asfb::simple_index(5000000, {{0, 1}, {n / 3, 1}, {2 * n / 3, 1}, {n - 1, 1}})};
     return asfb::build_packet_file(pf);
 }
 
-struct Subject {
-    std::string name;
-    Bytes bytes;
+// Every byte of the header's first 4 KiB (every fifth with the thread), then
+// every 97th (a cover picture makes a header of tens of kilobytes), then 40
+// places in the data.
+uint64_t next_cut(uint64_t n, const Use& u, bool thread) {
+    if (n < std::min<uint64_t>(u.header, 4096)) return n + (thread ? 5 : 1);
+    return n + (n < u.header ? 97 : std::max<uint64_t>(1, (u.size - u.header) / 40));
+}
+
+struct Kind {
+    const char* what;
+    uint64_t (*count)(const Use&);
+    void (*arm)(Player&, uint64_t n);
+    uint64_t stride = 1;       // every use up to the 64th, then every stride-th
+    int frames = 0;            // 1: frames are the clean session's; 2: and one at most lost
+    bool cut = false;          // the file itself ends after n - 1 bytes
+};
+const Kind kKinds[] = {
+    {"malloc fails", [](const Use& u) { return u.mallocs; },
+     [](Player& p, uint64_t n) { p.host.fail_malloc_at(n); }, 1, 1},
+    {"stream_alloc refused", [](const Use& u) { return u.allocs; },
+     [](Player& p, uint64_t n) { p.refuse_alloc_at(n); }, 1, 2},
+    {"stream_realloc refused", [](const Use& u) { return u.reallocs; },
+     [](Player& p, uint64_t n) { p.refuse_realloc_at(n); }, 1, 2},
+    {"seeks fail after", [](const Use& u) { return u.seeks; },
+     [](Player& p, uint64_t n) { p.input().faults().fail_seeks_after = int64_t(n) - 1; }},
+    {"reads end after", [](const Use& u) { return u.reads; },
+     [](Player& p, uint64_t n) { p.input().faults().fail_reads_after = int64_t(n) - 1; }},
+    {"reads shorter than", [](const Use&) { return uint64_t(17); },
+     [](Player& p, uint64_t n) { p.input().faults().max_read = n; }},
+    {"input ends after", [](const Use& u) { return u.size; },
+     [](Player& p, uint64_t n) { p.input().faults().end_after = n - 1; }, 0},
+    {"file cut at", [](const Use& u) { return u.size; }, [](Player&, uint64_t) {}, 0, 0, true},
 };
 
-// The built file, and real files when the corpus is there: one with video
-// and an index, one audio only with a cover picture.
-std::vector<Subject> subjects() {
-    std::vector<Subject> out = {{"built", built_file()}};
-    for (const char* name : {"moon-timecode-short.wmv", "musicmeta-issue_57-cover.wma"}) {
-        const std::string path = testenv::corpus_file(name);
-        if (!path.empty()) out.push_back({name, testenv::read_file_or_empty(path)});
-    }
-    return out;
-}
-
-// Arms `arm(n)` for n = 1..count, where count comes from the clean run.
-template <typename Count, typename Arm>
-void sweep(const Subject& s, Buffering b, Count count, Arm arm, uint64_t stride = 1) {
-    const Report clean = faults::run_session(s.bytes, b);
-    ASSERT_EQ(clean.open_rc, HOVA_OK) << s.name;
-    ASSERT_TRUE(clean.clean()) << faults::describe(clean);
-    const uint64_t total = count(clean);
-    if (total == 0) return;  // e.g. no stream_realloc for a file of small frames
-    for (uint64_t n = 1; n <= total + 1; n += (n < 64 ? 1 : stride)) {
-        SCOPED_TRACE(testing::Message() << s.name << ", " << faults::name_of(b) << ", at " << n
-                                        << " of " << total);
-        Fault f;
-        arm(f, n);
-        const Report r = faults::run_session(s.bytes, b, f);
-        EXPECT_TRUE(r.clean()) << faults::describe(r);
-    }
-}
-
-TEST(FaultSweep, EveryHostAllocationFailsInTurnThroughAWholeSession) {
-    for (const Subject& s : subjects())
-        for (Buffering b : kAllModes)
-            sweep(s, b, [](const Report& r) { return r.mallocs; },
-                  [](Fault& f, uint64_t n) { f.fail_malloc = n; });
-}
-
-// stream_realloc refused at each call in every mode, and stream_alloc
-// refused at each call in the modes the delivery tests do not sweep; the
-// session's seeks come between the refusals.
-TEST(FaultSweep, EveryFrameBufferRefusalInTurn) {
-    for (const Subject& s : subjects()) {
-        for (Buffering b : kAllModes) {
-            // The thread only changes how bytes arrive: a sample is enough there.
-            const uint64_t stride = b == Buffering::RingThread ? 17 : 1;
-            sweep(s, b, [](const Report& r) { return r.reallocs; },
-                  [](Fault& f, uint64_t n) { f.refuse_realloc = n; }, stride);
-            if (b != Buffering::Cache)
-                sweep(s, b, [](const Report& r) { return r.allocs; },
-                      [](Fault& f, uint64_t n) { f.refuse_alloc = n; }, stride * 3);
-        }
-    }
-}
-
-// The input ends early: at every byte of the header (and the data object's
-// header) in every buffering mode (sampled past 4 KiB),
-// at a sample of data offsets in every mode, then the whole session runs on
-// what there is.
-TEST(FaultSweep, InputEndingAtEveryHeaderByteAndAtDataSamples) {
-    for (const Subject& s : subjects()) {
-        // Where the first packet starts: past the header and the data object's header.
-        uint64_t hsize = 0;
-        for (int i = 7; i >= 0; --i) hsize = (hsize << 8) | s.bytes[16 + i];
-        const uint64_t header_end = std::min<uint64_t>(hsize + 50, s.bytes.size());
-        for (Buffering b : kAllModes) {
-            std::vector<uint64_t> cuts;
-            // Every byte of the first 4 KiB (every fifth with the thread,
-            // whose start and stop dominate), then every 97th: a cover
-            // picture makes a header of tens of kilobytes.
-            const uint64_t near = b == Buffering::RingThread ? 5 : 1;
-            for (uint64_t c = 0; c <= header_end; c += (c < 4096 ? near : 97))
-                cuts.push_back(c);
-            const uint64_t step = std::max<uint64_t>(1, (s.bytes.size() - header_end) / 40);
-            for (uint64_t c = header_end + 1; c < s.bytes.size(); c += step) cuts.push_back(c);
-            for (uint64_t cut : cuts) {
-                SCOPED_TRACE(testing::Message() << s.name << ", " << faults::name_of(b)
-                                                << ", input ends after " << cut);
-                Fault f;
-                f.end_after = cut;
-                const Report r = faults::run_session(s.bytes, b, f);
-                EXPECT_TRUE(r.clean()) << faults::describe(r);
-                if (cut < header_end) {
-                    EXPECT_NE(r.open_rc, HOVA_OK);
+TEST(FaultSweep, EveryFaultAtEveryUseThroughAWholeSession) {
+    std::vector<std::pair<std::string, Bytes>> files = {{"built", built_file()}};
+    for (const char* name : {"moon-timecode-short.wmv", "musicmeta-issue_57-cover.wma"})
+        if (!testenv::corpus_file(name).empty())
+            files.push_back({name, testenv::read_file_or_empty(testenv::corpus_file(name))});
+    for (const auto& [name, file] : files) {
+        for (host::Buffering b : host::kBufferings) {
+            const bool thread = b == host::Buffering::Thread;
+            const Use clean = session(file, b, [](Player&) {});
+            ASSERT_GT(clean.frames.size(), 5u) << name;
+            for (const Kind& k : kKinds) {
+                const uint64_t total = k.count(clean);
+                for (uint64_t n = 1; n <= total + 1;
+                     n = k.stride ? n + (n < 64 ? 1 : k.stride * (thread ? 17 : 1))
+                                  : next_cut(n, clean, thread)) {
+                    SCOPED_TRACE(testing::Message() << name << ", " << host::buffering_name(b)
+                                                    << ", " << k.what << " " << n << " of "
+                                                    << total);
+                    const Bytes cut(file.begin(), file.begin() + long(k.cut ? n - 1 : 0));
+                    const Use u = session(k.cut ? cut : file, b, [&](Player& p) { k.arm(p, n); });
+                    size_t known = 0;
+                    for (const auto& f : u.frames) known += clean.frames.count(f) > 0;
+                    EXPECT_TRUE(k.stride || n > clean.header || u.frames.empty());
+                    EXPECT_TRUE(!k.frames || known == u.frames.size()) << known;
+                    EXPECT_TRUE(k.frames < 2 || u.frames.size() + 1 >= clean.frames.size());
                 }
             }
         }
     }
 }
 
-TEST(FaultSweep, InputSeeksRefusedFromEveryCallOn) {
-    for (const Subject& s : subjects())
-        for (Buffering b : kAllModes)
-            sweep(s, b, [](const Report& r) { return r.input_seeks; },
-                  [](Fault& f, uint64_t n) { f.fail_seeks_after = static_cast<int64_t>(n - 1); });
+// On the device (32-bit ARM, run by scripts/test-arm) the host gives exactly
+// 2536 bytes of context, room for the fixed record and two stream records:
+// the sweeps above open audio and video in a buffer of exactly that size.
+TEST(DeviceContext, MinContextSizeIs2536BytesOn32BitArm) {
+    if (sizeof(void*) != 4) GTEST_SKIP() << "a 64-bit build has its own sizes";
+    EXPECT_EQ(hova_asff_demuxer.min_context_size, 2536);
+    EXPECT_EQ(sizeof(asf_demuxer_st) + 2 * sizeof(asf_stream_st), 2536u);
 }
 
 }  // namespace
