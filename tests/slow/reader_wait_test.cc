@@ -32,7 +32,7 @@ TEST(RingWait, ProducerGivesUpWhenNobodyReleases) {
 }
 
 TEST(ReaderWait, RingWithoutThreadTimesOutOnAnEmptyRingAndASeekStopsWaiting) {
-    Reader r(pattern(1000), options_for(Mode::SyncRing, 64, 256));
+    Reader r(pattern(1000), Mode::SyncRing, 64, 256);
     ASSERT_EQ(r.open(), 0);
     changeThreadType(&r.cb, 1);  // the multi-thread set, and no thread to fill the ring
     takes_ten_seconds([&] { EXPECT_EQ(r.take(10).size(), 0u); });
