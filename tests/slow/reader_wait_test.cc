@@ -2,24 +2,21 @@
 #include <gtest/gtest.h>
 
 #include <chrono>
-#include <vector>
 
 #include "../stream/reader_fixture.h"
 #include "stream_internal.h"
 
 using namespace readertest;
 
-namespace {
 // Runs f and checks that it returned after about ten seconds.
 template <typename F>
 void takes_ten_seconds(F f) {
     const auto t0 = std::chrono::steady_clock::now();
     f();
-    const double s = std::chrono::duration<double>(std::chrono::steady_clock::now() - t0).count();
-    EXPECT_GE(s, 8.9);
-    EXPECT_LE(s, 11.0);
+    const std::chrono::duration<double> s = std::chrono::steady_clock::now() - t0;
+    EXPECT_GE(s.count(), 8.9);
+    EXPECT_LE(s.count(), 11.0);
 }
-}  // namespace
 
 TEST(RingWait, ProducerGivesUpWhenNobodyReleases) {
     Bytes storage(8);
