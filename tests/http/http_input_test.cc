@@ -182,9 +182,10 @@ TEST(HttpInput, ServerWithoutRangesPlaysInOnePassRefusesSeeksAndEndsAtACut) {
         CuttingServer cutting(testenv::read_file_or_empty(path));
         ASSERT_FALSE(cutting.url.empty());
         const auto t0 = std::chrono::steady_clock::now();
-        const Played cut = play(input(cutting.url, b)), whole = play(input(path, b, false)),
-                     net = play(input(url, b)), seek = play(input(url, b), 20000000, 50);
+        const Played cut = play(input(cutting.url, b));
         EXPECT_LT(std::chrono::steady_clock::now() - t0, std::chrono::seconds(20));
+        const Played whole = play(input(path, b, false)), net = play(input(url, b)),
+                     seek = play(input(url, b), 20000000, 50);
         EXPECT_EQ(net.events, whole.events);
         EXPECT_NE(seek.seek_rc, HOVA_OK);
         for (const Played* p : {&cut, &net, &seek}) EXPECT_EQ(p->requests, 1u);
