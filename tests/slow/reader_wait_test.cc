@@ -2,24 +2,21 @@
 #include <gtest/gtest.h>
 
 #include <chrono>
-#include <vector>
 
 #include "../stream/reader_fixture.h"
 #include "stream_internal.h"
 
 using namespace readertest;
 
-namespace {
 // Runs f and checks that it returned after about ten seconds.
 template <typename F>
 void takes_ten_seconds(F f) {
     const auto t0 = std::chrono::steady_clock::now();
     f();
-    const double s = std::chrono::duration<double>(std::chrono::steady_clock::now() - t0).count();
-    EXPECT_GE(s, 8.9);
-    EXPECT_LE(s, 11.0);
+    const std::chrono::duration<double> s = std::chrono::steady_clock::now() - t0;
+    EXPECT_GE(s.count(), 8.9);
+    EXPECT_LE(s.count(), 11.0);
 }
-}  // namespace
 
 TEST(RingWait, ProducerGivesUpWhenNobodyReleases) {
     Bytes storage(8);
@@ -32,7 +29,7 @@ TEST(RingWait, ProducerGivesUpWhenNobodyReleases) {
 }
 
 TEST(ReaderWait, RingWithoutThreadTimesOutOnAnEmptyRingAndASeekStopsWaiting) {
-    Reader r(pattern(1000), options_for(Mode::SyncRing, 64, 256));
+    Reader r(pattern(1000), Mode::SyncRing, 64, 256);
     ASSERT_EQ(r.open(), 0);
     changeThreadType(&r.cb, 1);  // the multi-thread set, and no thread to fill the ring
     takes_ten_seconds([&] { EXPECT_EQ(r.take(10).size(), 0u); });
