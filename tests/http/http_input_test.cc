@@ -3,7 +3,7 @@
 // events it gives from the file in every buffering mode, also after a seek; a
 // seek costs the requests it is documented to cost; a server without range
 // support plays in one pass and refuses seeks; a connection cut halfway ends
-// the stream without a hang; a missing file or a refused connection says so.
+// the stream without a hang; asfdump takes a URL where it takes a file.
 #include <arpa/inet.h>
 #include <poll.h>
 #include <sys/socket.h>
@@ -200,16 +200,51 @@ TEST(HttpInput, ServerWithoutRangesPlaysInOnePassRefusesSeeksAndEndsAtACut) {
     }
 }
 
-TEST(HttpInput, AMissingFileOrARefusedConnectionSaysSo) {
+// asfdump takes a URL where it takes a file: the same output as the file read
+// the way the framework reads network input; HTTP failures give exit status 3
+// and a clear message, and a cut stream still closes with no block held.
+TEST(HttpInput, AsfdumpTakesAUrlWhereItTakesAFile) {
     REQUIRE_WEB_SERVER(server);
-    const std::pair<std::string, const char*> cases[] = {
-        {server->url("no-such-file.wmv"), "HTTP status 404"},
-        {"http://127.0.0.1:1/x.wmv", "onnect"}};
-    for (const auto& [url, says] : cases) {
-        std::string why;
-        EXPECT_FALSE(RawInput::from_url(url, {}, &why));
-        EXPECT_NE(why.find(says), std::string::npos) << why;
+    REQUIRE_CORPUS_FILE(path, "moon-timecode-long-with-audio.wmv");
+    CuttingServer cutting(testenv::read_file_or_empty(path));
+    const std::string url = server->url(base_name(path)), file = " '" + path + "' --streaming";
+    const std::string err = "/tmp/plimo_http_err_" + std::to_string(::getpid());
+    auto asfdump = [&](const std::string& args, std::string* out) {
+        const int rc = testenv::run_command(testenv::asfdump_path() + " " + args + " 2>" + err, out);
+        const auto text = testenv::read_file_or_empty(err);
+        return std::make_pair(rc, std::string(text.begin(), text.end()));
+    };
+    const struct {
+        std::string args;
+        int status;
+        std::string same_as;  // arguments over the file whose output must match ("" none)
+        const char* says;     // on stderr
+    } cases[] = {
+        {"frames " + url, 0, "frames" + file + " --buffer ring --thread", ""},
+        {"frames " + url + " --buffer none --seek 10000000", 0,
+         "frames" + file + " --buffer none --seek 10000000", ""},
+        {"info " + url, 0, "info" + file, ""},
+        {"frames " + server->url(base_name(path), false) + " --seek 10000000", 0, "",
+         "ignores range requests"},
+        {"info " + server->url("no-such-file.wmv"), 3, "", "HTTP status 404"},
+        {"frames http://127.0.0.1:1/x.wmv", 3, "", "cannot read"},
+        {"frames " + cutting.url, 3, "", "connection cut at byte"},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.args);
+        std::string out, ref;
+        const auto [rc, text] = asfdump(c.args, &out);
+        EXPECT_EQ(rc, c.status) << text;
+        EXPECT_NE(text.find(c.says), std::string::npos) << text;
+        if (!c.same_as.empty()) {
+            EXPECT_EQ(asfdump(c.same_as, &ref).first, 0);
+            EXPECT_EQ(out, ref);
+        }
+        if (c.status != 0 && !out.empty()) {
+            EXPECT_NE(out.find("\"blocks_outstanding\":0"), std::string::npos) << out;
+        }
     }
+    ::unlink(err.c_str());
 }
 
 }  // namespace
