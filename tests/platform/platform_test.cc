@@ -1,9 +1,7 @@
-// The log switch, the call shape and the stand-in platform log on stderr; and
-// UTF-16LE to UTF-8: each unit encoded on its own, a terminator appended when
-// the range has none, the measured size always equal to what is written.
+// The log switch and call shape; and UTF-16LE to UTF-8: each unit encoded on
+// its own, a terminator appended when the range has none, the measured size
+// always equal to what is written.
 #include <gtest/gtest.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
 #include <vector>
 
@@ -25,27 +23,6 @@ TEST(Log, MessagesGoOutAtDebugUnderTheTagWhileTheSwitchIsZero) {
     ASSERT_EQ(log.lines().size(), 1u) << "nothing is written while the switch is set";
     EXPECT_EQ(std::make_tuple(log.lines()[0].text, log.lines()[0].priority, log.lines()[0].tag),
               std::make_tuple("[ASF] open 7\n", int(ANDROID_LOG_DEBUG), "[PLIMO]"));
-}
-
-TEST(Log, StandInWritesOneLinePerMessageToStderrUnlessPlimoLogIsOff) {
-    for (const char* env : {"", "on", "off"}) {
-        int fds[2];
-        ASSERT_EQ(::pipe(fds), 0);
-        if (::fork() == 0) {
-            ::dup2(fds[1], 2);
-            if (*env) ::setenv("PLIMO_LOG", env, 1); else ::unsetenv("PLIMO_LOG");
-            __android_log_print(ANDROID_LOG_DEBUG, "[PLIMO]", "hello %s\n", "there");
-            __android_log_print(ANDROID_LOG_DEBUG, "[PLIMO]", "no newline");
-            ::_exit(0);
-        }
-        ::close(fds[1]);
-        std::string out;
-        char buf[256];
-        for (ssize_t n; (n = ::read(fds[0], buf, sizeof buf)) > 0;) out.append(buf, size_t(n));
-        ::close(fds[0]);
-        ::wait(nullptr);
-        EXPECT_EQ(out, std::string(env) == "off" ? "" : "D/[PLIMO]: hello there\nD/[PLIMO]: no newline\n") << env;
-    }
 }
 
 Bytes units(std::initializer_list<uint16_t> us) {
@@ -72,10 +49,10 @@ TEST(Utf16ToUtf8, MeasuresAndConvertsEachUnitWithinTheRange) {
     }
     const Bytes a0_more = {0x41, 0, 0, 0, 0x42, 0}, zero_first = units({0, 0x41});
     const uint8_t *t = a0_more.data() + 4, *z = zero_first.data();
-    auto len = [](const uint8_t* b, const uint8_t* e) { return get_UTF16_byte_length(b, e); };
-    EXPECT_EQ(std::vector<int>({len(a0_more.data(), t + 2), len(z, z + 4), len(t, t + 1),
-                                len(t, t), len(t + 2, t), len(t, t + 2), len(z + 1, z + 4)}),
-              std::vector<int>({4, 2, 1, 0, 0, 2, 3}));
+    EXPECT_EQ(std::vector<int>({get_UTF16_byte_length(a0_more.data(), t + 2), get_UTF16_byte_length(z, z + 4),
+                                get_UTF16_byte_length(t, t + 1), get_UTF16_byte_length(t + 2, t),
+                                get_UTF16_byte_length(t, t + 2), get_UTF16_byte_length(z + 1, z + 4)}),
+              std::vector<int>({4, 2, 1, 0, 2, 3}));
     uint8_t out[8] = {0x55};
     testenv::LogCapture log;
     EXPECT_EQ(calculate_UTF16_to_UTF8_size(t, t), 0);

@@ -44,9 +44,9 @@ TEST(Descriptor, ProbeFindsTheHeaderGuidAtTheStartOrBehindAnId3Tag) {
     std::memcpy(tagged.data() + 269, &asf_header_object, 16);
     auto edit = [](std::vector<uint8_t> v, size_t at, uint8_t x) { return v[at] ^= x, v; };
     const struct { std::vector<uint8_t> file; int len, expected; bool seekable = true, refuse_seek = false; }
-        cases[] = {{at0, 16, 1}, {at0, 15, 0}, {edit(at0, 15, 1), 64, 0}, {tagged, 64, 1},
-                   {tagged, 9, 0}, {tagged, 64, 0, false}, {tagged, 64, 0, true, true},
-                   {edit(tagged, 284, 0xFF), 64, 0}, {std::vector<uint8_t>(tagged.begin(), tagged.begin() + 284), 64, 0}};
+        cases[] = {{at0, 16, 1}, {at0, 15, 0}, {edit(at0, 15, 1), 64, 0}, {tagged, 64, 1}, {tagged, 9, 0},
+                   {tagged, 64, 0, false}, {tagged, 64, 0, true, true}, {edit(tagged, 284, 0xFF), 64, 0},
+                   {std::vector<uint8_t>(tagged.begin(), tagged.begin() + 284), 64, 0}};
     for (const auto& c : cases) {
         auto raw = host::RawInput::from_memory(c.file, {.seekable = c.seekable});
         raw->faults().refuse_seek = c.refuse_seek;

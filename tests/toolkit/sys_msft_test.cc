@@ -35,35 +35,35 @@ protected:
     sys_stream_st s{};
 };
 
+// What the corpus cannot show: AAC's frame-size block, the extensible forms,
+// a header cut short.
 TEST_F(MsftParse, AudioConfigKeepsWholeHeaderOrOnlyCodecDataAndStopsAtShortInput) {
     asfb::WaveFormat wma2, aac, pcm;
     wma2.extra = Bytes(10, 0xAB);
     aac.format_tag = 0x00FF, aac.block_align = 4, aac.extra = {0x12, 0x10};
     pcm.format_tag = 0x0001;
-    auto ext = [&pcm](const guid_st& g, const Bytes& tail) {
-        return asfb::waveformat_extensible(pcm, g, tail);
-    };
-    Bytes short_ext = ext(ac3_guid, {});
+    Bytes short_ext = asfb::waveformat_extensible(pcm, ac3_guid);
     short_ext.resize(30);
-    const Bytes wma2_hdr = asfb::waveformatex(wma2), pcm_ext = ext(asfb::tag_subformat(1), {});
+    const Bytes wma2_hdr = asfb::waveformatex(wma2), pcm_ext = asfb::waveformat_extensible(pcm, asfb::tag_subformat(1));
     const struct { Bytes wave; HOVAAudioType codec; Bytes config; uint32_t sample_size; } cases[] = {
         {wma2_hdr, CLIP_AUDIO_TYPE_WMA2, wma2_hdr, 1485},
         {asfb::waveformatex(aac), CLIP_AUDIO_TYPE_AAC, {0x12, 0x10}, 0},  // block = frame size
         {pcm_ext, CLIP_AUDIO_TYPE_LPCM, pcm_ext, 1485},
-        {ext(eac3_guid, {1, 2, 3}), CLIP_AUDIO_TYPE_EAC3, {1, 2, 3}, 1485},
-        {ext(asfb::tag_subformat(0x00FF), {9, 8}), CLIP_AUDIO_TYPE_AAC, {9, 8}, 1485},
-        {ext(mp2_guid, {}), CLIP_AUDIO_TYPE_MP3, {}, 1485},
+        {asfb::waveformat_extensible(pcm, eac3_guid, {1, 2, 3}), CLIP_AUDIO_TYPE_EAC3, {1, 2, 3}, 1485},
+        {asfb::waveformat_extensible(pcm, asfb::tag_subformat(0xFF), {9}), CLIP_AUDIO_TYPE_AAC, {9}, 1485},
         {short_ext, CLIP_AUDIO_TYPE_UNKNOWN, {}, 1485}};
     for (const auto& c : cases) {
         load(tkb::padded(c.wave, 1, 0xEE), uint32_t(c.wave.size()));  // 0xEE stays unread
         uint32_t unread = uint32_t(c.wave.size());
         ASSERT_EQ(sys_msft_parse_audio_header(&d, &s, &unread), HOVA_OK) << (&c - cases);
-        EXPECT_EQ(std::make_tuple(unread, s.codec_type, config(), s.info.aud.sample_size,
+        EXPECT_EQ(std::make_tuple(unread, s.codec_type, config(), s.info.aud.sample_size, s.info.aud.ch_num,
                                   cb_tell64(&d.cbuffer)),
-                  std::make_tuple(0u, c.codec, c.config, c.sample_size, c.wave.size())) << (&c - cases);
-        EXPECT_EQ(std::make_tuple(s.info.aud.sample_rate, s.info.aud.bit_rate, s.info.aud.ch_num,
-                                  s.info.aud.sample_depth), std::make_tuple(44100u, 128000u, 2u, 16u));
+                  std::make_tuple(0u, c.codec, c.config, c.sample_size, 2u, c.wave.size())) << (&c - cases);
     }
+    load(wma2_hdr, 0);  // no configuration block: nothing kept
+    uint32_t all = uint32_t(wma2_hdr.size());
+    ASSERT_EQ(sys_msft_parse_audio_header(&d, &s, &all), HOVA_OK);
+    EXPECT_EQ(std::make_pair(s.config_len, all), std::make_pair(0u, 12u));
     load(wma2_hdr, 15);  // fewer than 16 bytes announced
     uint32_t unread = 15;
     EXPECT_EQ(sys_msft_parse_audio_header(&d, &s, &unread), HOVA_EndOfStream);
