@@ -3,6 +3,7 @@
 // avcC and ID3 tags. Shared by the tests and the fuzzers' seed generator.
 #pragma once
 
+#include <algorithm>
 #include <cstdint>
 #include <string>
 #include <vector>
@@ -41,6 +42,11 @@ inline Bytes padded(Bytes b, size_t extra, uint8_t fill = 0) {
     b.resize(b.size() + extra, fill);
     return b;
 }
+inline Bytes pattern(size_t n, uint8_t seed) {
+    Bytes b(n);
+    for (size_t i = 0; i < n; ++i) b[i] = static_cast<uint8_t>(seed + i * 7);
+    return b;
+}
 
 // ---- AAC ----
 struct Asc {
@@ -48,19 +54,13 @@ struct Asc {
 };
 // Object type, rate index, channel configuration, then 3 zero GASpecificConfig bits.
 inline Bytes asc_bytes(const Asc& a) {
-    return BitWriter()
-        .put(a.object_type, 5)
-        .put(a.sf_index, 4)
-        .put(a.channel_config, 4)
-        .put(0, 3)
-        .bytes();
+    return BitWriter().put(a.object_type, 5).put(a.sf_index, 4).put(a.channel_config, 4).put(0, 3).bytes();
 }
-// One ADTS header (7 bytes, no CRC) followed by `payload` zero bytes.
-inline Bytes adts_frame(int sf_index, int channel_config, int payload = 0, int profile = 1,
-                        int layer = 0) {
+// One ADTS header (7 bytes, MPEG-4, no CRC, LC) followed by `payload` zero bytes.
+inline Bytes adts_frame(int sf_index, int channel_config, int payload = 0) {
     BitWriter w;
-    w.put(0xFFF, 12).put(0, 1).put(layer, 2).put(1, 1).put(profile, 2).put(sf_index, 4);
-    w.put(0, 1).put(channel_config, 3).put(0, 4).put(7 + payload, 13).put(0x7FF, 11).put(0, 2);
+    w.put(0xFFF, 12).put(0, 3).put(1, 1).put(1, 2).put(sf_index, 4).put(0, 1).put(channel_config, 3);
+    w.put(0, 4).put(7 + payload, 13).put(0x7FF, 11).put(0, 2);
     return padded(w.bytes(), static_cast<size_t>(payload));
 }
 
@@ -107,8 +107,7 @@ inline Bytes loas_frame(const LoasConfig& c, int payload = 4) {
 // AC-3 sync frame header (bit stream information up to dialnorm), padded.
 inline Bytes ac3_frame(int acmod, int lfeon, int frmsizecod = 10, int pad = 8) {
     BitWriter w;
-    w.put(0x0B77, 16).put(0x1234, 16).put(0, 2).put(frmsizecod, 6).put(8, 5).put(0, 3);
-    w.put(acmod, 3);
+    w.put(0x0B77, 16).put(0x1234, 16).put(0, 2).put(frmsizecod, 6).put(8, 5).put(0, 3).put(acmod, 3);
     if ((acmod & 1) && acmod != 1) w.put(1, 2);  // centre mix level
     if (acmod & 4) w.put(1, 2);                  // surround mix level
     if (acmod == 2) w.put(2, 2);                 // Dolby surround mode
@@ -123,29 +122,21 @@ inline Bytes eac3_frame(int acmod, int lfeon, int pad = 8) {
 // ---- AVC ----
 inline Bytes avcc(const std::vector<Bytes>& sps, const std::vector<Bytes>& pps,
                   int nal_length_size = 4) {
-    Bytes b = {1, 0x64, 0x00, 0x1F, static_cast<uint8_t>(0xFC | (nal_length_size - 1)),
-               static_cast<uint8_t>(0xE0 | sps.size())};
+    Bytes b = {1, 0x64, 0x00, 0x1F, static_cast<uint8_t>(0xFC | (nal_length_size - 1))};
     for (const auto* list : {&sps, &pps}) {
-        if (list == &pps) b.push_back(static_cast<uint8_t>(pps.size()));
+        b.push_back(static_cast<uint8_t>((list == &sps ? 0xE0 : 0) | list->size()));
         for (const auto& s : *list)
             b = cat({b, {static_cast<uint8_t>(s.size() >> 8), static_cast<uint8_t>(s.size())}, s});
     }
     return b;
 }
-inline Bytes pattern(size_t n, uint8_t seed) {
-    Bytes b(n);
-    for (size_t i = 0; i < n; ++i) b[i] = static_cast<uint8_t>(seed + i * 7);
-    return b;
-}
 
 // ---- ID3 ----
-inline Bytes be(uint32_t v, int n, int bits = 8) {
+inline Bytes be(uint32_t v, int n, int bits = 8) {  // bits 7: syncsafe
     Bytes b;
-    for (int i = n - 1; i >= 0; --i) b.push_back(static_cast<uint8_t>((v >> (bits * i)) & 0xFF));
-    if (bits == 7) for (auto& x : b) x &= 0x7F;
+    for (int i = n - 1; i >= 0; --i) b.push_back(static_cast<uint8_t>((v >> (bits * i)) & (bits == 7 ? 0x7F : 0xFF)));
     return b;
 }
-inline Bytes syncsafe(uint32_t v) { return be(v, 4, 7); }
 inline Bytes text(const std::string& s) { return Bytes(s.begin(), s.end()); }
 
 struct Id3Frame {
@@ -161,12 +152,10 @@ inline Id3Frame text_frame(const std::string& id, uint8_t encoding, const Bytes&
 inline Bytes id3_frames(int version, const std::vector<Id3Frame>& frames) {
     Bytes out;
     for (const auto& f : frames) {
-        const auto size = static_cast<uint32_t>(f.stored_size >= 0 ? f.stored_size
-                                                                   : int64_t(f.body.size()));
+        const auto size = static_cast<uint32_t>(f.stored_size >= 0 ? f.stored_size : int64_t(f.body.size()));
         Bytes id = text(f.id);
         id.resize(version == 2 ? 3 : 4, 0);
-        const Bytes sz = version == 2 ? be(size, 3)
-                       : (version == 4 && !f.plain_size_v4) ? syncsafe(size) : be(size, 4);
+        const Bytes sz = be(size, version == 2 ? 3 : 4, version == 4 && !f.plain_size_v4 ? 7 : 8);
         out = cat({out, id, sz, version == 2 ? Bytes{} : Bytes{0, 0}, f.body});
     }
     return out;
@@ -174,18 +163,14 @@ inline Bytes id3_frames(int version, const std::vector<Id3Frame>& frames) {
 // A whole tag: header, the given body (frames or anything else), padding.
 inline Bytes id3_tag(int version, const Bytes& body, size_t padding = 0, uint8_t flags = 0) {
     const Bytes head = {'I', 'D', '3', static_cast<uint8_t>(version), 0, flags};
-    return padded(cat({head, syncsafe(static_cast<uint32_t>(body.size() + padding)), body}),
-                  padding);
+    return padded(cat({head, be(static_cast<uint32_t>(body.size() + padding), 4, 7), body}), padding);
 }
 // The 128-byte ID3v1 block.
 inline Bytes id3v1(const std::string& title, const std::string& artist, const std::string& album,
                    const std::string& year, const std::string& comment, uint8_t genre) {
     Bytes out = text("TAG");
-    for (const auto& [s, width] : {std::pair{title, 30}, {artist, 30}, {album, 30}, {year, 4},
-                                   {comment, 30}}) {
-        Bytes f = text(s.substr(0, width));
-        out = cat({out, padded(f, static_cast<size_t>(width) - f.size())});
-    }
+    for (const auto& [s, width] : {std::pair{title, 30}, {artist, 30}, {album, 30}, {year, 4}, {comment, 30}})
+        out = cat({out, padded(text(s.substr(0, width)), width - std::min<size_t>(s.size(), width))});
     out.push_back(genre);
     return out;
 }
