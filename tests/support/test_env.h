@@ -19,8 +19,8 @@ bool read_file(const std::string& path, std::vector<uint8_t>* out);
 std::vector<uint8_t> read_file_or_empty(const std::string& path);
 
 // Path of the built plug-in and of asfdump.
-std::string plugin_path();
-std::string asfdump_path();
+inline std::string plugin_path() { return PLIMO_BINARY_DIR "/libplimo_asf.so"; }
+inline std::string asfdump_path() { return PLIMO_BINARY_DIR "/asfdump"; }
 
 // Runs a shell command, returning its exit status and standard output.
 int run_command(const std::string& cmd, std::string* out);
@@ -31,8 +31,7 @@ class LogCapture {
 public:
     struct Line {
         int priority;
-        std::string tag;
-        std::string text;
+        std::string tag, text;
     };
     LogCapture();
     ~LogCapture();
@@ -43,14 +42,13 @@ public:
     void clear() { lines_.clear(); }
 
 private:
-    static void hook(int prio, const char* tag, const char* text, void* user);
     std::vector<Line> lines_;
 };
 
 }  // namespace testenv
 
 // Skips the current test with a message when a corpus file is missing.
-#define REQUIRE_CORPUS_FILE(var, name)                                         \
-    const std::string var = testenv::corpus_file(name);                        \
+#define REQUIRE_CORPUS_FILE(var, name)                                            \
+    const std::string var = testenv::corpus_file(name);                           \
     if (var.empty()) GTEST_SKIP() << "corpus file " << (name) << " not found in " \
                                   << testenv::corpus_dir()
