@@ -3,6 +3,8 @@
 // reads (its records' exact fields) and more streams than the context holds.
 #include <gtest/gtest.h>
 
+#include <algorithm>
+#include <cctype>
 #include <cstring>
 #include <functional>
 #include <tuple>
@@ -54,9 +56,13 @@ TEST(Open, RefusesMalformedHeaders) {
 }
 
 // WMV3 stream 2 and WMA2 stream 1 (hidden in the header extension) with
-// bitrates and languages, descriptive metadata, a cover and an index behind
-// an unknown object of `unknown_size` (empty: its real size).
+// bitrates and languages, descriptive metadata (a later genre replacing the
+// first), a cover and an index behind an unknown object of `unknown_size`
+// (empty: its real size).
 Bytes rich_file(Size unknown_size = {}, Bytes* header = nullptr) {
+    auto cover = [](uint8_t fill) {
+        return Writer().u8(3).u32(16).utf16("image/png").utf16("").bytes(Bytes(16, fill)).out;
+    };
     File f = standard_file();
     f.header_children = {
         file_properties({}),
@@ -69,10 +75,11 @@ Bytes rich_file(Size unknown_size = {}, Bytes* header = nullptr) {
         content_description({"T", "A", "C", "D", "R"}),
         extended_content_description(
             {{"WM/AlbumTitle", 0, string_value("Al")},
-             {"WM/Year", 0, string_value("2001")},
              {"WM/Genre", 0, string_value("Rock")},
-             {"WM/Picture", 1,
-              Writer().u8(3).u32(16).utf16("image/png").utf16("").bytes(Bytes(16, 2)).out}})};
+             {"WM/Genre", 0, string_value(std::string(999, 'g'))},  // the longest converted
+             {"WM/Picture", 1, cover(2)},
+             {"WM/Picture", 1, cover(3)},  // only the first is kept
+             {"WM/Year", 0, string_value("2001")}})};
     f.trailing = {object(guid_from_text("D6E229D3-35DA-11D1-9034-00A0C90349BE"), Bytes(30, 0),
                          unknown_size),
                   simple_index(5000000, {{0, 1}, {1, 1}, {2, 1}})};
@@ -89,9 +96,9 @@ TEST(Open, RichFileFillsEveryRecord) {
     EXPECT_TRUE(log.contains("[ASF] found hidden stream!\n"));
     asf_demuxer_st* d = o.ctx();
     EXPECT_EQ(std::tuple(d->first_packet, d->s.cbuffer.curpos, d->index_count,
-                         d->index_time_interval, d->index_packet),
+                         d->index_time_interval, d->index_packet, d->index_start_offset),
               std::tuple(header.size() + 50, header.size() + 50, 3u, 500000u,
-                         bytes.size() - 3 * 6));
+                         bytes.size() - 3 * 6, -1));
     EXPECT_EQ(o.session->input().counters().open_done_calls, 1u);
     // Reader, two configurations, cover, title, author, album, genre, index.
     EXPECT_EQ(o.session->blocks_outstanding(), 9u);
@@ -122,13 +129,15 @@ TEST(Open, RichFileFillsEveryRecord) {
     hova_program_info_st p;
     std::memset(&p, 0xFF, sizeof p);
     ASSERT_EQ(dmx.get_info(d, HOVA_STREAM_PROG, 0, &p), HOVA_OK);
-    EXPECT_EQ(std::tuple(p.duration, p.num_audio_streams, p.num_video_streams,
-                         p.active_subtitle, p.year, std::string(p.genre)),
-              std::tuple(2000000, 1, 1, -1, 2001, "Rock"));
+    EXPECT_EQ(std::tuple(p.duration, p.num_audio_streams, p.num_video_streams, p.active_audio,
+                         p.active_video, p.active_subtitle, p.year, std::string(p.genre)),
+              std::tuple(2000000, 1, 1, 0, 0, -1, 2001, std::string(999, 'g')));
     EXPECT_EQ(std::tuple(p.title.size, p.artist.size, p.album.size), std::tuple(4u, 4u, 6u));
     ASSERT_EQ(p.cover.length, 16);
     EXPECT_EQ(Bytes(p.cover.payload, p.cover.payload + 16), Bytes(16, 2));
-    EXPECT_EQ(static_cast<size_t>(p.pic_offset), header.size() - 16);
+    const Bytes first_cover(16, 2);
+    EXPECT_EQ(p.pic_offset, std::search(bytes.begin(), bytes.end(), first_cover.begin(),
+                                        first_cover.end()) - bytes.begin());
     EXPECT_TRUE(o.close_clean());
 }
 
@@ -137,6 +146,34 @@ TEST(Open, ObjectOfSizeZeroBehindTheDataEndsTheSearchForTheIndex) {
     ASSERT_EQ(o.rc, HOVA_OK);
     EXPECT_EQ(o.ctx()->index_count, 0u) << "the index behind it is out of reach";
     EXPECT_TRUE(o.close_clean());
+}
+
+// With no packet count in the file properties, the count comes from the data
+// object's size, else from the input's size (two packets' worth of bytes
+// follow the data): given by a streaming input, measured on a seekable one,
+// unknown on an input that is neither.
+TEST(Open, PacketCountFromTheDataObjectElseTheInputSize) {
+    const uint64_t unbounded = (uint64_t{INT64_MAX} - UINT32_MAX) / 3200;
+    const struct {
+        Size data_size;
+        host::InputOptions in;
+        uint64_t packets;
+    } cases[] = {
+        {{}, {}, 3},
+        {50, {}, 5},
+        {50, {.seekable = false, .streaming = true}, 5},
+        {50, {.seekable = false}, unbounded},
+    };
+    for (const auto& c : cases) {
+        File f = file_with({audio_stream(1)}, {.packet_count = 0});
+        f.packets.assign(3, Bytes(3200, 0));
+        f.data_object_size = c.data_size;
+        f.trailing = {Bytes(6400, 0)};
+        Opened o = testsupport::open_file(f, {.input = c.in});
+        ASSERT_EQ(o.rc, HOVA_OK);
+        EXPECT_EQ(o.ctx()->num_packets, c.packets) << "case " << &c - cases;
+        EXPECT_TRUE(o.close_clean());
+    }
 }
 
 // Size fields that break naive arithmetic, on every object the walk reads,
@@ -189,53 +226,49 @@ TEST(Open, HostileSizeFieldsNeverOpenOrLeak) {
 }
 
 // More streams than the context has records: the last of each kind is kept.
+// Streams are written as kind and number in header order ("a1v2"), upper
+// case when hidden in the header extension (behind the others).
 TEST(StreamProps, MoreStreamsThanRecordsKeepTheLastOfEachKind) {
-    const Bytes a1 = audio_stream(1), a2 = audio_stream(2), a3 = audio_stream(3),
-                a4 = audio_stream(4), v1 = video_stream(1), v2 = video_stream(2),
-                v3 = video_stream(3), v4 = video_stream(4);
     const struct {
-        const char* what;
-        int records;                 // stream records the host buffer holds
-        std::vector<Bytes> streams;  // in header order
-        int rc;
-        std::vector<int> kept;           // stream numbers of the records, in order
+        const char* streams;
+        int records;                     // stream records the host buffer holds
+        std::string kept;                // stream numbers of the records; "": refused
         int active_audio, active_video;  // stream numbers; 0 for none
     } cases[] = {
-        {"two audio languages and video, one audio hidden", 2, {a1, v2, ext({a3})}, HOVA_OK,
-         {2, 3}, 3, 2},
-        {"two audio before video", 2, {a1, a2, v3}, HOVA_OK, {2, 3}, 2, 3},
-        {"video first, then three audio", 2, {v1, a2, a3, a4}, HOVA_OK, {1, 4}, 4, 1},
-        {"two video", 2, {a1, v2, v3}, HOVA_OK, {1, 3}, 1, 3},
-        {"a larger buffer keeps every stream", 3, {a1, v2, a3}, HOVA_OK, {1, 2, 3}, 3, 2},
-        {"a larger buffer, one record too few", 3, {a1, a2, a3, v4}, HOVA_OK, {2, 3, 4}, 3, 4},
-        {"one record, audio only", 1, {a1, a2}, HOVA_OK, {2}, 2, 0},
-        {"one record cannot hold audio and video", 1, {a1, v2}, HOVA_NotEnoughMemory, {}, 0, 0},
-        {"no record at all", 0, {a1}, HOVA_NotEnoughMemory, {}, 0, 0},
+        {"a1v2A3", 2, "23", 3, 2},     {"a1a2v3", 2, "23", 2, 3},   {"v1a2a3a4", 2, "14", 4, 1},
+        {"a1v2v3", 2, "13", 1, 3},     {"a1v2a3", 3, "123", 3, 2},  {"a1a2a3v4", 3, "234", 3, 4},
+        {"a1a2", 1, "2", 2, 0},        {"a1v2", 1, "", 0, 0},       {"a1", 0, "", 0, 0},
     };
     for (const auto& c : cases) {
-        SCOPED_TRACE(c.what);
+        SCOPED_TRACE(c.streams);
+        std::vector<Bytes> top, hidden;
+        for (const char* s = c.streams; *s; s += 2) {
+            const Bytes b = std::tolower(*s) == 'a' ? audio_stream(s[1] - '0') : video_stream(s[1] - '0');
+            (std::isupper(*s) ? hidden : top).push_back(b);
+        }
+        if (!hidden.empty()) top.push_back(ext(hidden));
         host::SessionOptions so;
         so.context_size =
             static_cast<int>(sizeof(asf_demuxer_st) + 8 + c.records * sizeof(asf_stream_st));
         so.misalign = 1;  // the context starts 7 bytes in: exactly `records` fit
-        Opened o = testsupport::open_file(file_with(c.streams), so);
-        ASSERT_EQ(o.rc, c.rc) << host::errno_name(o.rc);
+        Opened o = testsupport::open_file(file_with(top), so);
+        ASSERT_EQ(o.rc, c.kept.empty() ? HOVA_NotEnoughMemory : HOVA_OK) << host::errno_name(o.rc);
         if (o.rc == HOVA_OK) {
             asf_demuxer_st* d = o.ctx();
-            EXPECT_EQ(d->max_streams, c.records);
-            ASSERT_EQ(d->s.total_streams, static_cast<int>(c.kept.size()));
+            std::string kept;
             int count[2] = {};
             for (int i = 0; i < d->s.total_streams; ++i) {
-                EXPECT_EQ(d->stream_info[i].stream_num, c.kept[i]) << "record " << i;
+                kept += static_cast<char>('0' + d->stream_info[i].stream_num);
                 ++count[d->stream_info[i].s.stream_type == HOVA_STREAM_AUDIO ? AUD : VID];
             }
             auto num_of = [&](int k) {
                 const int a = d->s.active_stream[k];
                 return a < 0 ? 0 : d->stream_info[a].stream_num;
             };
-            EXPECT_EQ(std::tuple(d->s.num_streams[AUD], d->s.num_streams[VID], num_of(AUD),
-                                 num_of(VID)),
-                      std::tuple(count[AUD], count[VID], c.active_audio, c.active_video));
+            EXPECT_EQ(std::tuple(d->max_streams, kept, d->s.num_streams[AUD], d->s.num_streams[VID],
+                                 num_of(AUD), num_of(VID)),
+                      std::tuple(c.records, c.kept, count[AUD], count[VID], c.active_audio,
+                                 c.active_video));
         }
         EXPECT_TRUE(o.close_clean()) << "a replaced record's configuration block leaked";
     }

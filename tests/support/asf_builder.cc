@@ -1,5 +1,6 @@
 #include "asf_builder.h"
 
+#include <cstdio>
 #include <stdexcept>
 
 // Records are written with designated initializers, naming only what differs.
@@ -7,34 +8,12 @@
 
 namespace asfb {
 
-namespace {
-
 // The file ID of the file properties, the data object and the index.
 constexpr guid_st kFileId = {0x5A2F7E40, 0x95C5, 0x4E2A, {0x9E, 0x8A, 0x3B, 0x8E, 0x1F, 0x0A, 0x2C, 0x11}};
 constexpr guid_st kNoEc = {0x20FB5700, 0x5B55, 0x11CF, {0xA8, 0xFD, 0x00, 0x80, 0x5F, 0x5C, 0x44, 0x2B}};
 
-uint64_t hex(const std::string& s) {
-    uint64_t v = 0;
-    for (char c : s) {
-        const int d = c >= '0' && c <= '9' ? c - '0' : c >= 'A' && c <= 'F' ? c - 'A' + 10
-                    : c >= 'a' && c <= 'f' ? c - 'a' + 10 : -1;
-        if (d < 0) throw std::invalid_argument("guid: bad hex digit");
-        v = v << 4 | static_cast<uint64_t>(d);
-    }
-    return v;
-}
-
-Bytes concat(const std::vector<Bytes>& parts) {
-    Writer w;
-    for (const Bytes& p : parts) w.bytes(p);
-    return w.out;
-}
-
-}  // namespace
-
 Writer& Writer::guid(const guid_st& g) {
-    u32(g.data1).u16(g.data2).u16(g.data3);
-    return bytes(Bytes(g.data4, g.data4 + 8));
+    return u32(g.data1).u16(g.data2).u16(g.data3).bytes(Bytes(g.data4, g.data4 + 8));
 }
 
 Writer& Writer::utf16(const std::string& text) {
@@ -46,11 +25,12 @@ Writer& Writer::utf16(const std::string& text) {
 }
 
 guid_st guid_from_text(const std::string& t) {
-    if (t.size() != 36) throw std::invalid_argument("guid: bad text form");
-    guid_st g{static_cast<uint32_t>(hex(t.substr(0, 8))), static_cast<uint16_t>(hex(t.substr(9, 4))),
-              static_cast<uint16_t>(hex(t.substr(14, 4))), {}};
-    const std::string rest = t.substr(19, 4) + t.substr(24, 12);
-    for (int i = 0; i < 8; ++i) g.data4[i] = static_cast<uint8_t>(hex(rest.substr(2 * i, 2)));
+    guid_st g;
+    uint8_t* b = g.data4;
+    if (t.size() != 36 || std::sscanf(t.c_str(), "%8x-%4hx-%4hx-%2hhx%2hhx-%2hhx%2hhx%2hhx%2hhx%2hhx%2hhx",
+                                      &g.data1, &g.data2, &g.data3, b, b + 1, b + 2, b + 3, b + 4,
+                                      b + 5, b + 6, b + 7) != 11)
+        throw std::invalid_argument("guid: bad text form");
     return g;
 }
 
@@ -66,9 +46,8 @@ Bytes file_properties(const FileProps& p, Size declared) {
 }
 
 Bytes waveformatex(const WaveFormat& f) {
-    Writer w;
-    w.u16(f.format_tag).u16(f.channels).u32(f.sample_rate).u32(f.bytes_per_second);
-    return w.u16(f.block_align).u16(f.bits_per_sample).u16(f.extra.size()).bytes(f.extra).out;
+    return Writer().u16(f.format_tag).u16(f.channels).u32(f.sample_rate).u32(f.bytes_per_second)
+        .u16(f.block_align).u16(f.bits_per_sample).u16(f.extra.size()).bytes(f.extra).out;
 }
 
 guid_st tag_subformat(uint16_t tag) {
@@ -86,17 +65,13 @@ Bytes waveformat_extensible(const WaveFormat& base, const guid_st& sub, const By
 
 Bytes bitmapinfoheader(const BitmapInfo& b) {
     if (b.fourcc.size() != 4) throw std::invalid_argument("fourcc: four characters");
-    Writer w;
-    w.u32(40 + b.codec_private.size()).u32(static_cast<uint32_t>(b.width));
-    w.u32(static_cast<uint32_t>(b.height)).u16(1).u16(24).bytes(Bytes(b.fourcc.begin(), b.fourcc.end()));
-    return w.bytes(Bytes(20, 0)).bytes(b.codec_private).out;
+    return Writer().u32(40 + b.codec_private.size()).u32(b.width).u32(b.height).u16(1).u16(24)
+        .bytes(Bytes(b.fourcc.begin(), b.fourcc.end())).bytes(Bytes(20, 0)).bytes(b.codec_private).out;
 }
 
 Bytes video_type_specific(const BitmapInfo& b) {
     const Bytes bih = bitmapinfoheader(b);
-    Writer w;
-    w.u32(static_cast<uint32_t>(b.width)).u32(static_cast<uint32_t>(b.height)).u8(2);
-    return w.u16(bih.size()).bytes(bih).out;
+    return Writer().u32(b.width).u32(b.height).u8(2).u16(bih.size()).bytes(bih).out;
 }
 
 Bytes stream_properties(const StreamProps& s, Size declared) {
@@ -122,10 +97,7 @@ Bytes extended_stream_properties(const ExtStreamProps& e, Size declared) {
     // which only the bitrate is read.
     w.u64(0).u64(0).u32(e.bitrate).u32(3000).bytes(Bytes(24, 0)).u16(e.stream_num);
     w.u16(e.language_index).u64(e.avg_time_per_frame).u16(e.names.size()).u16(e.ext_systems.size());
-    for (const auto& [lang, name] : e.names) {
-        const Bytes n = Writer().utf16(name).out;
-        w.u16(lang).u16(n.size()).bytes(n);
-    }
+    for (const auto& [lang, name] : e.names) w.u16(lang).u16(2 * name.size() + 2).utf16(name);
     for (const PayloadExtSystem& p : e.ext_systems)
         w.guid(p.id).u16(p.data_size).u32(p.info.size()).bytes(p.info);
     return object(asf_extended_stream_prop_object, w.bytes(e.embedded_stream).out, declared);
@@ -139,18 +111,17 @@ Bytes language_list(const std::vector<std::string>& tags, Size declared) {
 }
 
 Bytes header_extension(const std::vector<Bytes>& children, Size declared, uint16_t reserved2) {
-    const Bytes body = concat(children);
+    const Bytes body = Writer().all(children).out;
     return object(asf_header_extension_object,
                   Writer().guid(asf_reserved_1).u16(reserved2).u32(body.size()).bytes(body).out,
                   declared);
 }
 
-Bytes content_description(const ContentDesc& c, Size declared) {
+Bytes content_description(const std::array<std::string, 5>& c, Size declared) {
     Writer lengths, strings;
-    for (const std::string* s : {&c.title, &c.author, &c.copyright, &c.description, &c.rating}) {
-        const size_t before = strings.out.size();
-        if (!s->empty()) strings.utf16(*s);
-        lengths.u16(strings.out.size() - before);
+    for (const std::string& s : c) {
+        lengths.u16(s.empty() ? 0 : 2 * s.size() + 2);
+        if (!s.empty()) strings.utf16(s);
     }
     return object(asf_content_desc_object, lengths.bytes(strings.out).out, declared);
 }
@@ -158,24 +129,21 @@ Bytes content_description(const ContentDesc& c, Size declared) {
 Bytes extended_content_description(const std::vector<Descriptor>& ds, Size declared) {
     Writer w;
     w.u16(ds.size());
-    for (const Descriptor& d : ds) {
-        const Bytes name = string_value(d.name);
-        w.u16(name.size()).bytes(name).u16(d.data_type).u16(d.value.size()).bytes(d.value);
-    }
+    for (const Descriptor& d : ds)
+        w.u16(2 * d.name.size() + 2).utf16(d.name).u16(d.data_type).u16(d.value.size()).bytes(d.value);
     return object(asf_extended_content_desc_object, w.out, declared);
 }
 
 Bytes string_value(const std::string& text) { return Writer().utf16(text).out; }
 
 Bytes header_object(const std::vector<Bytes>& children, Size declared) {
-    return object(asf_header_object,
-                  Writer().u32(children.size()).u8(1).u8(2).bytes(concat(children)).out, declared);
+    return object(asf_header_object, Writer().u32(children.size()).u8(1).u8(2).all(children).out,
+                  declared);
 }
 
 Bytes data_object(const std::vector<Bytes>& packets, Size declared) {
     return object(asf_data_object,
-                  Writer().guid(kFileId).u64(packets.size()).u16(0x0101).bytes(concat(packets)).out,
-                  declared);
+                  Writer().guid(kFileId).u64(packets.size()).u16(0x0101).all(packets).out, declared);
 }
 
 Bytes simple_index(uint64_t interval_100ns, const std::vector<IndexEntry>& entries) {
@@ -193,8 +161,8 @@ Bytes build(const File& f) {
         for (int shift : {21, 14, 7, 0}) w.u8((f.id3_payload >> shift) & 0x7F);
         w.bytes(Bytes(f.id3_payload, 0));
     }
-    w.bytes(header_object(f.header_children)).bytes(data_object(f.packets, f.data_object_size));
-    return w.bytes(concat(f.trailing)).out;
+    return w.bytes(header_object(f.header_children))
+        .bytes(data_object(f.packets, f.data_object_size)).all(f.trailing).out;
 }
 
 File standard_file(bool audio, bool video, uint32_t packets) {

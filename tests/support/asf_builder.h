@@ -5,6 +5,7 @@
 // elsewhere (asf_packets.h), so packet layouts never touch the header side.
 #pragma once
 
+#include <array>
 #include <cstdint>
 #include <optional>
 #include <string>
@@ -31,6 +32,10 @@ struct Writer {
     Writer& u32(uint64_t v) { return le(v, 4); }
     Writer& u64(uint64_t v) { return le(v, 8); }
     Writer& bytes(const Bytes& b) { return out.insert(out.end(), b.begin(), b.end()), *this; }
+    Writer& all(const std::vector<Bytes>& parts) {
+        for (const Bytes& b : parts) bytes(b);
+        return *this;
+    }
     Writer& guid(const guid_st& g);
     // UTF-8 text as terminated UTF-16LE (BMP only).
     Writer& utf16(const std::string& text);
@@ -42,10 +47,8 @@ guid_st guid_from_text(const std::string& text);
 Bytes object(const guid_st& guid, const Bytes& body, Size declared = {});
 
 struct FileProps {
-    uint64_t packet_count = 1;
-    uint64_t play_duration = 20000000 + 30000000;  // 100-ns units, preroll included
-    uint64_t send_duration = 20000000;
-    uint64_t preroll = 3000;                       // ms
+    // Durations in 100-ns units (the play duration with the preroll), preroll in ms.
+    uint64_t packet_count = 1, play_duration = 50000000, send_duration = 20000000, preroll = 3000;
     uint32_t flags = 0x2;                          // seekable, not broadcast
     uint32_t min_packet_size = 3200, max_packet_size = 3200;
 };
@@ -74,8 +77,7 @@ Bytes bitmapinfoheader(const BitmapInfo& b);
 Bytes video_type_specific(const BitmapInfo& b);
 
 struct StreamProps {
-    guid_st stream_type = asf_audio_media;
-    guid_st ec_type = {};      // none
+    guid_st stream_type = asf_audio_media, ec_type = {};  // no error correction
     uint64_t time_offset = 0;  // 100-ns units
     uint16_t flags = 1;        // stream number in bits 0-6
     Bytes type_specific, ec_data;
@@ -85,11 +87,7 @@ Bytes audio_stream(uint16_t number, const WaveFormat& w = {});
 Bytes video_stream(uint16_t number, const BitmapInfo& b = {});
 
 // ---- header extension ----
-struct PayloadExtSystem {
-    guid_st id = {};
-    uint16_t data_size = 0xFFFF;
-    Bytes info;
-};
+struct PayloadExtSystem { guid_st id = {}; uint16_t data_size = 0xFFFF; Bytes info; };
 struct ExtStreamProps {
     uint32_t bitrate = 128000;
     uint16_t stream_num = 1, language_index = 0;
@@ -104,15 +102,9 @@ Bytes header_extension(const std::vector<Bytes>& children, Size declared = {},
                        uint16_t reserved2 = 6);
 
 // ---- descriptive metadata ----
-struct ContentDesc {
-    std::string title, author, copyright, description, rating;
-};
-Bytes content_description(const ContentDesc& c, Size declared = {});
-struct Descriptor {
-    std::string name;
-    uint16_t data_type = 0;
-    Bytes value;
-};
+// Title, author, copyright, description, rating.
+Bytes content_description(const std::array<std::string, 5>& c, Size declared = {});
+struct Descriptor { std::string name; uint16_t data_type = 0; Bytes value; };
 Bytes extended_content_description(const std::vector<Descriptor>& d, Size declared = {});
 Bytes string_value(const std::string& text);  // UTF-16LE with terminator
 
@@ -120,10 +112,7 @@ Bytes string_value(const std::string& text);  // UTF-16LE with terminator
 Bytes header_object(const std::vector<Bytes>& children, Size declared = {});
 // Data object over packets built elsewhere; each packet is taken verbatim.
 Bytes data_object(const std::vector<Bytes>& packets, Size declared = {});
-struct IndexEntry {
-    uint32_t packet_number;
-    uint16_t packet_count;
-};
+struct IndexEntry { uint32_t packet_number; uint16_t packet_count; };
 Bytes simple_index(uint64_t interval_100ns, const std::vector<IndexEntry>& entries);
 
 // A whole file: optional ID3v2 prefix (a tag header and `id3_payload` zero

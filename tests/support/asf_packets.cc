@@ -14,7 +14,7 @@ int width(uint8_t type) { return type == 3 ? 4 : type; }
 
 uint32_t header_size(const PacketLayout& l) {
     return (l.error_correction ? 3 : 0) + 8 + width(l.packet_len_type) + width(l.sequence_type) +
-           width(l.padding_len_type) + (l.multiple ? 1 : 0);
+           width(l.padding_len_type) + l.multiple;
 }
 
 uint32_t payload_header_size(const PacketLayout& l, const Payload& p) {
@@ -22,23 +22,17 @@ uint32_t payload_header_size(const PacketLayout& l, const Payload& p) {
            static_cast<uint32_t>(p.replicated.size()) + (l.multiple ? width(l.payload_len_type) : 0);
 }
 
-Payload payload(uint8_t stream, uint32_t object_num, uint32_t offset, Bytes replicated, Bytes data,
-                bool key) {
-    return {stream, key, object_num, offset, std::move(replicated), std::move(data), {}};
-}
-
 }  // namespace
 
 Payload media(uint8_t stream, uint32_t object_num, uint32_t offset, uint32_t object_size,
               uint32_t pts_ms, Bytes data, bool key, uint32_t extra) {
-    return payload(stream, object_num, offset,
-                   Writer().u32(object_size).u32(pts_ms).bytes(Bytes(extra, 0xEE)).out,
-                   std::move(data), key);
+    return {stream, key, object_num, offset,
+            Writer().u32(object_size).u32(pts_ms).bytes(Bytes(extra, 0xEE)).out, std::move(data)};
 }
 
 Payload untimed(uint8_t stream, uint32_t object_num, uint32_t offset, Bytes data,
                 uint32_t replicated_len, bool key) {
-    return payload(stream, object_num, offset, Bytes(replicated_len, 0xAB), std::move(data), key);
+    return {stream, key, object_num, offset, Bytes(replicated_len, 0xAB), std::move(data)};
 }
 
 Payload compressed(uint8_t stream, uint32_t object_num, uint32_t pts_ms, uint8_t delta_ms,
@@ -48,7 +42,7 @@ Payload compressed(uint8_t stream, uint32_t object_num, uint32_t pts_ms, uint8_t
         if (s.size() > 255) throw std::invalid_argument("sub-payload longer than 255 bytes");
         w.u8(s.size()).bytes(s);
     }
-    return payload(stream, object_num, pts_ms, {delta_ms}, w.out, key);
+    return {stream, key, object_num, pts_ms, {delta_ms}, w.out};
 }
 
 Bytes packet(const std::vector<Payload>& payloads, uint32_t packet_size, const PacketLayout& layout) {
@@ -58,19 +52,18 @@ Bytes packet(const std::vector<Payload>& payloads, uint32_t packet_size, const P
     for (const Payload& p : payloads) used += payload_header_size(l, p) + p.data.size();
     const uint32_t padding = used < packet_size ? packet_size - used : 0;
     Writer w;
-    auto field = [&w](uint8_t type, uint32_t v) { w.le(v, width(type)); };
+    auto field = [&w](uint8_t type, uint64_t v) { w.le(v, width(type)); };
     if (l.error_correction) w.u8(0x82).u16(0);
     w.u8(l.multiple | l.sequence_type << 1 | l.padding_len_type << 3 | l.packet_len_type << 5);
     // Stream number length type 1 in the property flags: not read.
     w.u8(l.replicated_len_type | l.offset_type << 2 | l.object_num_type << 4 | 1 << 6);
     // With no padding field, the packet length tells the padding.
-    const uint32_t len = l.padding_len_type == 0 && l.packet_len_type != 0 ? used : packet_size;
-    field(l.packet_len_type, l.packet_len.value_or(len));
+    field(l.packet_len_type, l.packet_len.value_or(
+                                 l.padding_len_type == 0 && l.packet_len_type != 0 ? used : packet_size));
     field(l.sequence_type, 0);
     field(l.padding_len_type, l.padding_len.value_or(padding));
     w.u32(0).u16(0);  // send time, duration
-    if (l.multiple)
-        w.u8((l.num_payloads.value_or(payloads.size()) & 0x3F) | l.payload_len_type << 6);
+    if (l.multiple) w.u8((l.num_payloads.value_or(payloads.size()) & 0x3F) | l.payload_len_type << 6);
     for (const Payload& p : payloads) {
         w.u8((p.stream & 0x7F) | (p.key ? 0x80 : 0));
         field(l.object_num_type, p.object_num);
@@ -116,7 +109,7 @@ std::vector<Bytes> mux(const std::vector<Object>& objects, uint32_t packet_size,
     };
     for (const Object& o : objects) {
         const uint32_t num = next_num.try_emplace(o.stream, first_object_num).first->second++ & 0xFF;
-        const uint32_t size = static_cast<uint32_t>(o.data.size());
+        const auto size = static_cast<uint32_t>(o.data.size());
         uint32_t offset = 0;
         do {
             Payload p = media(o.stream, num, offset, size, o.pts_ms, {}, o.key);
@@ -159,16 +152,13 @@ Bytes build_packet_file(const PacketFile& f) {
                    .preroll = f.preroll_ms, .flags = f.broadcast ? 0x1u : 0x2u,
                    .min_packet_size = f.packet_size, .max_packet_size = f.packet_size})},
               .packets = f.packets, .trailing = f.trailing, .data_object_size = f.data_object_size};
-    if (f.audio) {
-        StreamProps s{.time_offset = f.audio_time_offset, .type_specific = waveformatex({})};
-        if (f.spread.span) {
-            s.ec_type = asf_spread_audio;
-            const auto& sp = f.spread;
-            s.ec_data = Writer().u8(sp.span).u16(sp.packet_len).u16(sp.chunk_len)
-                            .u16(sp.packet_len).u8(0).out;
-        }
-        file.header_children.push_back(stream_properties(s));
-    }
+    const auto& sp = f.spread;
+    if (f.audio)
+        file.header_children.push_back(stream_properties(
+            {.ec_type = sp.span ? asf_spread_audio : guid_st{}, .time_offset = f.audio_time_offset,
+             .type_specific = waveformatex({}),
+             .ec_data = sp.span ? Writer().u8(sp.span).u16(sp.packet_len).u16(sp.chunk_len)
+                                      .u16(sp.packet_len).u8(0).out : Bytes{}}));
     if (f.video) file.header_children.push_back(video_stream(2));
     return build(file);
 }

@@ -57,13 +57,10 @@ struct PacketLayout {
 Bytes packet(const std::vector<Payload>& payloads, uint32_t packet_size,
              const PacketLayout& layout = {});
 
-// Damage a packet the way delivery rejects it.
-enum class Damage {
-    PacketLenTooLong,  // packet length field = packet_size + 1
-    PaddingTooLong,    // padding length field = packet_size + 1
-    NoPayloads,        // payload flags announce 0 payloads
-    PayloadTooLong,    // first payload length = packet_size + 1
-};
+// Damage a packet the way delivery rejects it: the packet length field, the
+// padding length field or the first payload's length field says
+// packet_size + 1, or the payload flags announce no payload.
+enum class Damage { PacketLenTooLong, PaddingTooLong, NoPayloads, PayloadTooLong };
 Bytes damaged_packet(Damage how, const std::vector<Payload>& payloads, uint32_t packet_size);
 
 // `junk` bytes, then a good packet, cut back to `packet_size` bytes: the
@@ -72,12 +69,7 @@ Bytes misaligned_packet(const Bytes& junk, const std::vector<Payload>& payloads,
                         uint32_t packet_size, const PacketLayout& layout = {});
 
 // One media object to mux.
-struct Object {
-    uint8_t stream;
-    uint32_t pts_ms;
-    Bytes data;
-    bool key = false;
-};
+struct Object { uint8_t stream; uint32_t pts_ms; Bytes data; bool key = false; };
 // Packs objects in the order given into packets of `packet_size`, splitting
 // each into fragments as room allows; object numbers count per stream from
 // `first_object_num`. `fill` (0: the packet size) caps the bytes used in
@@ -102,10 +94,7 @@ struct PacketFile {
     bool audio = true, video = true;
     std::optional<uint64_t> packet_count;  // default: packets.size()
     uint64_t audio_time_offset = 0;        // 100-ns units
-    struct {
-        uint8_t span = 0;
-        uint16_t packet_len = 0, chunk_len = 0;
-    } spread;
+    struct { uint8_t span = 0; uint16_t packet_len = 0, chunk_len = 0; } spread;
     std::vector<Bytes> packets, trailing;
     bool broadcast = false;
     std::optional<uint64_t> data_object_size;  // declared (50: a recorded live stream's)

@@ -43,8 +43,7 @@ bool read_file(const std::string& path, std::vector<uint8_t>* out) {
 
 std::vector<uint8_t> read_file_or_empty(const std::string& path) {
     std::vector<uint8_t> v;
-    read_file(path, &v);
-    return v;
+    return read_file(path, &v), v;
 }
 
 int run_command(const std::string& cmd, std::string* out) {
@@ -59,11 +58,9 @@ int run_command(const std::string& cmd, std::string* out) {
 }
 
 LogCapture::LogCapture() {
-    plimo_log_set_hook(
-        [](int prio, const char* tag, const char* text, void* user) {
-            static_cast<LogCapture*>(user)->lines_.push_back({prio, tag ? tag : "", text ? text : ""});
-        },
-        this);
+    plimo_log_set_hook([](int prio, const char* tag, const char* text, void* user) {
+        static_cast<LogCapture*>(user)->lines_.push_back({prio, tag ? tag : "", text ? text : ""});
+    }, this);
 }
 LogCapture::~LogCapture() { plimo_log_set_hook(nullptr, nullptr); }
 
