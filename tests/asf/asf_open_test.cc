@@ -6,7 +6,6 @@
 #include <algorithm>
 #include <cctype>
 #include <cstring>
-#include <functional>
 #include <tuple>
 
 #include "asf_open.h"
@@ -87,6 +86,15 @@ Bytes rich_file(Size unknown_size = {}, Bytes* header = nullptr) {
     return build(f);
 }
 
+// An information record of the open file, filled over 0xFF bytes.
+template <class T>
+T info(void* d, hova_stream_type_et type, int index = 0) {
+    T t;
+    std::memset(&t, 0xFF, sizeof t);
+    EXPECT_EQ(dmx.get_info(d, type, index, &t), HOVA_OK) << type;
+    return t;
+}
+
 TEST(Open, RichFileFillsEveryRecord) {
     Bytes header;
     const Bytes bytes = rich_file({}, &header);
@@ -104,31 +112,24 @@ TEST(Open, RichFileFillsEveryRecord) {
     EXPECT_EQ(o.session->blocks_outstanding(), 9u);
 
     hova_clip_info_st clip;
-    std::memset(&clip, 0xFF, sizeof clip);
     for (int t : {int{HOVA_STREAM_SUBTITLE}, int{HOVA_STREAM_CLIP}, -1, 99})
         EXPECT_EQ(dmx.get_info(d, static_cast<hova_stream_type_et>(t), 0, &clip),
                   HOVA_InvalidParam);
-    ASSERT_EQ(dmx.get_info(d, HOVA_STREAM_NONE, 0, &clip), HOVA_OK);
+    clip = info<hova_clip_info_st>(d, HOVA_STREAM_NONE);
     EXPECT_EQ(std::tuple(clip.seekable, clip.num_program, clip.ts_type, clip.seek_without_index),
               std::tuple(1, 1, HOVA_TS_DTS, 0));
 
-    hova_video_info_st v;
-    std::memset(&v, 0xFF, sizeof v);
-    ASSERT_EQ(dmx.get_info(d, HOVA_STREAM_VIDEO, -1, &v), HOVA_OK);
+    const auto v = info<hova_video_info_st>(d, HOVA_STREAM_VIDEO, -1);
     EXPECT_EQ(std::tuple(v.codec, v.width, v.height, v.frame_rate_num, v.frame_rate_den,
                          v.bit_rate, v.hdr10_metadata.maxCLL),
               std::tuple(CLIP_VIDEO_TYPE_WMV3, 208, 160, 1000000, 33366, 100000, 0));
 
-    hova_audio_info_st a;
-    std::memset(&a, 0xFF, sizeof a);
-    ASSERT_EQ(dmx.get_info(d, HOVA_STREAM_AUDIO, 0, &a), HOVA_OK);
+    const auto a = info<hova_audio_info_st>(d, HOVA_STREAM_AUDIO);
     EXPECT_EQ(std::tuple(a.codec, a.sample_rate, a.bit_rate, std::string(a.language),
                          a.desc.payload),
               std::tuple(CLIP_AUDIO_TYPE_WMA2, 44100, 64040, "eng", nullptr));
 
-    hova_program_info_st p;
-    std::memset(&p, 0xFF, sizeof p);
-    ASSERT_EQ(dmx.get_info(d, HOVA_STREAM_PROG, 0, &p), HOVA_OK);
+    const auto p = info<hova_program_info_st>(d, HOVA_STREAM_PROG);
     EXPECT_EQ(std::tuple(p.duration, p.num_audio_streams, p.num_video_streams, p.active_audio,
                          p.active_video, p.active_subtitle, p.year, std::string(p.genre)),
               std::tuple(2000000, 1, 1, 0, 0, -1, 2001, std::string(999, 'g')));
@@ -184,41 +185,28 @@ TEST(Open, HostileSizeFieldsNeverOpenOrLeak) {
                               (1ull << 32) + 24, 1ull << 63, ~0ull - 23, ~0ull};
     const Bytes pic = string_value("WM/Picture");
     const Bytes library = Writer().u16(1).u32(0).u16(pic.size()).u16(1).u32(10).bytes(pic).out;
-    const std::function<Bytes(Size)> objects[] = {
-        [](Size s) { return file_properties({}, s); },
-        [](Size s) { return stream_properties({.type_specific = waveformatex({})}, s); },
-        [](Size s) { return header_extension({}, s); },
-        [](Size s) { return content_description({"t", "a", "", "", ""}, s); },
-        [](Size s) {
-            return extended_content_description({{"WM/Y", 0, string_value("1")}}, s);
-        },
-        [](Size s) {
-            return object(guid_from_text("01020304-0506-0708-090A-0B0C0D0E0F10"), Bytes(8, 0), s);
-        },
-        [](Size s) { return ext({extended_stream_properties({}, s)}); },
-        [](Size s) { return ext({language_list({"en"}, s)}); },
-        [&](Size s) {
-            return ext({object(asf_metadata_library_object,
-                               Writer().bytes(library).bytes(Bytes(10, 1)).out, s)});
-        },
-    };
-    for (const auto& make : objects) {
-        const uint64_t real = make(std::nullopt).size();
+    // Top-level objects, then children of the header extension.
+    const Bytes objects[] = {
+        file_properties({}), stream_properties({.type_specific = waveformatex({})}),
+        header_extension({}), content_description({"t", "a", "", "", ""}),
+        extended_content_description({{"WM/Y", 0, string_value("1")}}),
+        object(guid_from_text("01020304-0506-0708-090A-0B0C0D0E0F10"), Bytes(8, 0)),
+        extended_stream_properties({}), language_list({"en"}),
+        object(asf_metadata_library_object, Writer().bytes(library).bytes(Bytes(10, 1)).out)};
+    for (const Bytes& real : objects) {
         for (uint64_t size : sizes) {
+            Bytes sized = real;
+            for (int i = 0; i < 8; ++i) sized[16 + i] = static_cast<uint8_t>(size >> (8 * i));
+            if (&real - objects >= 6) sized = ext({sized});
             for (Size hs : {Size{}, Size{~0ull}}) {
-                SCOPED_TRACE(testing::Message() << "object of " << real << " bytes, size " << size
-                                                << (hs ? ", endless header" : ""));
+                SCOPED_TRACE(testing::Message() << "object of " << real.size() << " bytes, size "
+                                                << size << (hs ? ", endless header" : ""));
                 Opened o = testsupport::open_bytes(
-                    Writer()
-                        .bytes(header_object({file_properties({}), make(size), audio_stream(1)}, hs))
-                        .bytes(data_object({Bytes(3200, 0)}))
-                        .out);
-                if (o.rc == HOVA_OK) {
-                    EXPECT_TRUE(size >= 24 && size <= real);
-                } else {
-                    EXPECT_TRUE(o.rc == HOVA_OpenFailed || o.rc == HOVA_EndOfStream ||
-                                o.rc == HOVA_NotEnoughMemory) << o.rc;
-                }
+                    Writer().bytes(header_object({file_properties({}), sized, audio_stream(1)}, hs))
+                        .bytes(data_object({Bytes(3200, 0)})).out);
+                EXPECT_TRUE(o.rc == HOVA_OK ? size >= 24 && size <= real.size()
+                                            : o.rc == HOVA_OpenFailed || o.rc == HOVA_EndOfStream ||
+                                                  o.rc == HOVA_NotEnoughMemory) << o.rc;
                 EXPECT_TRUE(o.close_clean());
             }
         }

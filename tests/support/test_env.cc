@@ -46,6 +46,9 @@ std::vector<uint8_t> read_file_or_empty(const std::string& path) {
     return read_file(path, &v), v;
 }
 
+std::string plugin_path() { return PLIMO_BINARY_DIR "/libplimo_asf.so"; }
+std::string asfdump_path() { return PLIMO_BINARY_DIR "/asfdump"; }
+
 int run_command(const std::string& cmd, std::string* out) {
     FILE* p = ::popen(cmd.c_str(), "r");
     if (!p) return -1;

@@ -17,8 +17,8 @@ std::vector<std::string> corpus_files();
 bool read_file(const std::string& path, std::vector<uint8_t>* out);
 std::vector<uint8_t> read_file_or_empty(const std::string& path);
 // Path of the built plug-in and of asfdump.
-inline std::string plugin_path() { return PLIMO_BINARY_DIR "/libplimo_asf.so"; }
-inline std::string asfdump_path() { return PLIMO_BINARY_DIR "/asfdump"; }
+std::string plugin_path();
+std::string asfdump_path();
 // Runs a shell command, returning its exit status and standard output.
 int run_command(const std::string& cmd, std::string* out);
 
