@@ -59,6 +59,11 @@ TEST(Open, RefusesMalformedHeaders) {
 // first), a cover and an index behind an unknown object of `unknown_size`
 // (empty: its real size).
 Bytes rich_file(Size unknown_size = {}, Bytes* header = nullptr) {
+    // The longest genre converted to UTF-8: "€" and 498 "é", 1000 bytes with
+    // the terminator in either form.
+    Writer genre;
+    genre.u16(0x20AC);
+    for (int i = 0; i < 498; ++i) genre.u16(0xE9);
     auto cover = [](uint8_t fill) {
         return Writer().u8(3).u32(16).utf16("image/png").utf16("").bytes(Bytes(16, fill)).out;
     };
@@ -75,7 +80,7 @@ Bytes rich_file(Size unknown_size = {}, Bytes* header = nullptr) {
         extended_content_description(
             {{"WM/AlbumTitle", 0, string_value("Al")},
              {"WM/Genre", 0, string_value("Rock")},
-             {"WM/Genre", 0, string_value(std::string(999, 'g'))},  // the longest converted
+             {"WM/Genre", 0, genre.u16(0).out},
              {"WM/Picture", 1, cover(2)},
              {"WM/Picture", 1, cover(3)},  // only the first is kept
              {"WM/Year", 0, string_value("2001")}})};
@@ -130,9 +135,11 @@ TEST(Open, RichFileFillsEveryRecord) {
               std::tuple(CLIP_AUDIO_TYPE_WMA2, 44100, 64040, "eng", nullptr));
 
     const auto p = info<hova_program_info_st>(d, HOVA_STREAM_PROG);
+    std::string genre = "\xE2\x82\xAC";
+    for (int i = 0; i < 498; ++i) genre += "\xC3\xA9";
     EXPECT_EQ(std::tuple(p.duration, p.num_audio_streams, p.num_video_streams, p.active_audio,
                          p.active_video, p.active_subtitle, p.year, std::string(p.genre)),
-              std::tuple(2000000, 1, 1, 0, 0, -1, 2001, std::string(999, 'g')));
+              std::tuple(2000000, 1, 1, 0, 0, -1, 2001, genre));
     EXPECT_EQ(std::tuple(p.title.size, p.artist.size, p.album.size), std::tuple(4u, 4u, 6u));
     ASSERT_EQ(p.cover.length, 16);
     EXPECT_EQ(Bytes(p.cover.payload, p.cover.payload + 16), Bytes(16, 2));
