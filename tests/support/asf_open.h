@@ -14,13 +14,9 @@ namespace testsupport {
 struct Opened {
     std::unique_ptr<host::Session> session;
     int rc = -1;
-
     asf_demuxer_st* ctx() const { return static_cast<asf_demuxer_st*>(session->context()); }
     // Closes when open; true when the host then holds no block of the plug-in.
-    bool close_clean() {
-        session->close();
-        return session->blocks_outstanding() == 0;
-    }
+    bool close_clean() { return session->close(), session->blocks_outstanding() == 0; }
 };
 
 inline Opened open_bytes(std::vector<uint8_t> bytes, const host::SessionOptions& opts = {}) {
@@ -34,13 +30,13 @@ inline Opened open_file(const asfb::File& f, const host::SessionOptions& opts = 
     return open_bytes(asfb::build(f), opts);
 }
 
-// A file with the usual file properties and the given header children after it.
+// A file with the given file properties, the given header children after
+// them and `packet_count` zero-filled packets.
 inline asfb::File file_with(std::vector<asfb::Bytes> children, asfb::FileProps fp = {}) {
     asfb::File f;
-    f.header_children.push_back(asfb::file_properties(fp));
-    for (auto& c : children) f.header_children.push_back(std::move(c));
-    for (uint64_t i = 0; i < fp.packet_count; ++i)
-        f.packets.push_back(asfb::filler_packet(fp.min_packet_size));
+    f.header_children = std::move(children);
+    f.header_children.insert(f.header_children.begin(), asfb::file_properties(fp));
+    f.packets.assign(fp.packet_count, asfb::Bytes(fp.min_packet_size));
     return f;
 }
 

@@ -19,9 +19,9 @@ struct Payload {
     uint8_t stream = 1;
     bool key = false;
     uint32_t object_num = 0;
-    uint32_t offset = 0;       // offset into the object; presentation time when compressed
+    uint32_t offset = 0;  // offset into the object; presentation time when compressed
     Bytes replicated;
-    Bytes data;                // payload data (sub-payloads already framed when compressed)
+    Bytes data;  // payload data (sub-payloads already framed when compressed)
     std::optional<uint32_t> declared_len;  // payload length field; default data.size()
 };
 
@@ -39,44 +39,28 @@ Payload compressed(uint8_t stream, uint32_t object_num, uint32_t pts_ms, uint8_t
                    const std::vector<Bytes>& subs, bool key = false);
 
 // Header layout of a packet. Length-type codes: 0 absent, 1 byte, 2 word, 3 dword.
+// Error correction, when present, is two bytes of zeros; send time and
+// duration are zero.
 struct PacketLayout {
     bool error_correction = true;
-    uint8_t ec_flags = 0x82;       // written as is; its low bits give the data length
-    Bytes ec_data = {0, 0};
-    bool multiple = true;          // multiple-payloads flag (forced on for 2+ payloads)
-    uint8_t packet_len_type = 0;
-    uint8_t sequence_type = 0;
-    uint8_t padding_len_type = 2;
-    uint8_t replicated_len_type = 1;
-    uint8_t offset_type = 3;
-    uint8_t object_num_type = 1;
-    uint8_t stream_num_type = 1;   // not read by the demuxer; stored in the flags
+    bool multiple = true;  // multiple-payloads flag (forced on for 2+ payloads)
+    uint8_t packet_len_type = 0, sequence_type = 0, padding_len_type = 2;
+    uint8_t replicated_len_type = 1, offset_type = 3, object_num_type = 1;
     uint8_t payload_len_type = 2;  // multiple payloads only
-    uint32_t send_time = 0;
-    uint16_t duration = 0;
     // Values written instead of the computed ones (to make damaged packets).
-    std::optional<uint32_t> packet_len;
-    std::optional<uint32_t> padding_len;
+    std::optional<uint32_t> packet_len, padding_len;
     std::optional<uint8_t> num_payloads;
 };
-
-// Bytes of the header before the first payload header.
-uint32_t packet_header_size(const PacketLayout& l);
-// Bytes of one payload's header in a packet of this layout.
-uint32_t payload_header_size(const PacketLayout& l, const Payload& p);
 
 // A packet of exactly `packet_size` bytes (padding at the end). When the
 // payloads do not fit the packet grows; tests that want that say so.
 Bytes packet(const std::vector<Payload>& payloads, uint32_t packet_size,
              const PacketLayout& layout = {});
 
-// Damage a packet the way delivery rejects it.
-enum class Damage {
-    PacketLenTooLong,    // packet length field = packet_size + 1
-    PaddingTooLong,      // padding length field = packet_size + 1
-    NoPayloads,          // payload flags announce 0 payloads
-    PayloadTooLong,      // first payload length = packet_size + 1
-};
+// Damage a packet the way delivery rejects it: the packet length field, the
+// padding length field or the first payload's length field says
+// packet_size + 1, or the payload flags announce no payload.
+enum class Damage { PacketLenTooLong, PaddingTooLong, NoPayloads, PayloadTooLong };
 Bytes damaged_packet(Damage how, const std::vector<Payload>& payloads, uint32_t packet_size);
 
 // `junk` bytes, then a good packet, cut back to `packet_size` bytes: the
@@ -85,17 +69,11 @@ Bytes misaligned_packet(const Bytes& junk, const std::vector<Payload>& payloads,
                         uint32_t packet_size, const PacketLayout& layout = {});
 
 // One media object to mux.
-struct Object {
-    uint8_t stream;
-    uint32_t pts_ms;
-    Bytes data;
-    bool key = false;
-};
+struct Object { uint8_t stream; uint32_t pts_ms; Bytes data; bool key = false; };
 // Packs objects in the order given into packets of `packet_size`, splitting
 // each into fragments as room allows; object numbers count per stream from
-// `first_object_num`.
-// `fill` (0: the packet size) caps the bytes used in each packet, leaving the
-// rest as padding.
+// `first_object_num`. `fill` (0: the packet size) caps the bytes used in
+// each packet, leaving the rest as padding.
 std::vector<Bytes> mux(const std::vector<Object>& objects, uint32_t packet_size,
                        const PacketLayout& layout = {}, uint8_t first_object_num = 1,
                        uint32_t fill = 0);
@@ -113,18 +91,11 @@ Bytes pattern(size_t n, uint32_t seed);
 struct PacketFile {
     uint32_t packet_size = 1024;
     uint64_t preroll_ms = 0;
-    bool audio = true;
-    bool video = true;
+    bool audio = true, video = true;
     std::optional<uint64_t> packet_count;  // default: packets.size()
     uint64_t audio_time_offset = 0;        // 100-ns units
-    uint64_t video_time_offset = 0;
-    struct {
-        uint8_t span = 0;
-        uint16_t packet_len = 0;
-        uint16_t chunk_len = 0;
-    } spread;
-    std::vector<Bytes> packets;
-    std::vector<Bytes> trailing;
+    struct { uint8_t span = 0; uint16_t packet_len = 0, chunk_len = 0; } spread;
+    std::vector<Bytes> packets, trailing;
     bool broadcast = false;
     std::optional<uint64_t> data_object_size;  // declared (50: a recorded live stream's)
 };
