@@ -153,11 +153,11 @@ TEST_P(CorpusDelivery, FramesMatchTheReferenceInEveryBufferingMode) {
     Player base(file, with_buffering(host::Buffering::Cache), true);
     const std::vector<std::string> played = answers_and_play(base);
     // One file also plays as the original with a longer extension tail.
-    const std::vector<uint8_t> changed = with_longer_extension_tail(file);
-    EXPECT_TRUE(GetParam() != "moon-timecode-short.wmv" || !changed.empty());
-    for (int m = 0; m < 8; ++m) {
+    const bool change = GetParam() == "moon-timecode-short.wmv";
+    const std::vector<uint8_t> changed = change ? with_longer_extension_tail(file) : file;
+    EXPECT_FALSE(changed.empty());
+    for (int m = 1; m < (change ? 8 : 4); ++m) {
         SCOPED_TRACE(testing::Message() << host::buffering_name(kBufferings[m % 4]) << (m > 3 ? " changed" : ""));
-        if (m == 0 || (m > 3 && (changed.empty() || GetParam() != "moon-timecode-short.wmv"))) continue;
         Player other(m > 3 ? changed : file, with_buffering(kBufferings[m % 4]));
         std::vector<std::string> got = answers_and_play(other);
         if (m > 3) got.back() = played.back();  // its header is longer
