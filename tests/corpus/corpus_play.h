@@ -4,8 +4,8 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <memory>
-#include <sstream>
 #include <string>
 #include <vector>
 
@@ -15,9 +15,6 @@
 #include "test_env.h"
 
 namespace corpus {
-
-using host::EventKind;
-using host::HostEvent;
 
 struct Player {
     explicit Player(std::unique_ptr<host::RawInput> in, bool keep_bytes = false)
@@ -29,13 +26,17 @@ struct Player {
         : Player(host::RawInput::from_memory(f, in), keep) {}
     host::HostCallbacks& cb() { return s.callbacks(); }
     asf_demuxer_st* ctx() { return static_cast<asf_demuxer_st*>(s.context()); }
-    std::vector<HostEvent> frames(hova_stream_type_et t) { return cb().commits(t, 0); }
-    bool framed_since(size_t from) {
-        for (size_t i = from; i < cb().events().size(); ++i)
-            if (cb().events()[i].kind == EventKind::Commit && !cb().events()[i].packet_type)
-                return true;
-        return false;
+    // Media frames of a kind committed since event `from`.
+    std::vector<host::HostEvent> frames(hova_stream_type_et t, size_t from = 0) {
+        std::vector<host::HostEvent> out;
+        for (size_t i = from; i < cb().events().size(); ++i) {
+            const host::HostEvent& e = cb().events()[i];
+            if (e.kind == host::EventKind::Commit && !e.packet_type && (!t || e.type == t))
+                out.push_back(e);
+        }
+        return out;
     }
+    bool framed_since(size_t from) { return !frames(HOVA_STREAM_NONE, from).empty(); }
     int step() {
         cb().call = ++calls;
         hova_stream_type_et t = HOVA_STREAM_NONE;
@@ -54,12 +55,9 @@ struct Player {
     // Every event as a line, then the last result and the number of calls.
     std::vector<std::string> trace() {
         std::vector<std::string> out;
-        for (const HostEvent& e : cb().events()) {
-            std::ostringstream l;
-            l << e.call << ' ' << static_cast<int>(e.kind) << ' ' << e.type << ' ' << e.packet_type
-              << ' ' << e.size << ' ' << e.pts << ' ' << e.crc32;
-            out.push_back(l.str());
-        }
+        for (const host::HostEvent& e : cb().events())
+            out.push_back(testing::PrintToString(std::vector<int64_t>{
+                int64_t(e.call), int(e.kind), e.type, e.packet_type, e.size, e.pts, e.crc32}));
         out.push_back("last " + std::to_string(last) + " calls " + std::to_string(calls));
         return out;
     }

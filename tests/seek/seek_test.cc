@@ -1,0 +1,345 @@
+// Seeking in built files: one audio object (stream 1) and one video object
+// (stream 2) per 1024-byte packet, frame i in packet i at i x 100 ms, with a
+// simple index written the way encoders write it (entry j names the packet
+// of the last key frame at or before j seconds) or given entry by entry.
+#include <gtest/gtest.h>
+
+#include <cstring>
+#include <optional>
+
+#include "../delivery/delivery_fixture.h"
+#include "asf_timestamp.h"
+#include "streaming.h"
+#include "test_env.h"
+
+namespace {
+
+using asfb::Bytes;
+using delivery::Player;
+constexpr int B = HOVA_SEEK_BACKWARD, F = HOVA_SEEK_FORWARD;
+constexpr hova_stream_type_et kAudio = HOVA_STREAM_AUDIO, kVideo = HOVA_STREAM_VIDEO;
+
+struct Clip {
+    const char* name = "";
+    uint32_t key_every = 10, key_first = 0, packets = 100, preroll_ms = 0;
+    bool audio = true, video = true, index = true;
+    int64_t audio_lag_ms = 0;                            // audio object i at i x 100 ms + lag
+    std::optional<std::vector<uint32_t>> entries;        // packet numbers
+    uint32_t declared_entries = 0;                       // 0: as many as written
+    uint64_t interval_100ns = 10000000, duration_100ns = 0;  // 0: the packets' span + preroll
+};
+
+bool is_key(const Clip& c, uint32_t i) { return i >= c.key_first && (i - c.key_first) % c.key_every == 0; }
+
+Bytes build(const Clip& c) {
+    asfb::File f;
+    asfb::FileProps fp;
+    fp.packet_count = c.packets;
+    fp.min_packet_size = fp.max_packet_size = 1024;
+    fp.preroll = c.preroll_ms;
+    fp.play_duration = c.duration_100ns ? c.duration_100ns : (c.packets * 100ull + c.preroll_ms) * 10000;
+    f.header_children = {asfb::file_properties(fp)};
+    if (c.audio) f.header_children.push_back(asfb::audio_stream(1));
+    if (c.video) f.header_children.push_back(asfb::video_stream(2));
+    std::vector<asfb::IndexEntry> entries;
+    for (uint32_t i = 0, last_key = c.key_first; i < c.packets; ++i) {
+        std::vector<asfb::Payload> pl;
+        const uint32_t ms = i * 100 + c.preroll_ms, num = i + 1;
+        if (c.audio) pl.push_back(asfb::media(1, num, 0, 100, uint32_t(ms + c.audio_lag_ms), asfb::pattern(100, 0xA000 + i)));
+        if (c.video) pl.push_back(asfb::media(2, num, 0, 200, ms, asfb::pattern(200, 0x5000 + i), is_key(c, i)));
+        f.packets.push_back(asfb::packet(pl, 1024));
+        last_key = is_key(c, i) ? i : last_key;
+        if (i % 10 == 0) entries.push_back({last_key, 1});
+    }
+    if (c.entries) {
+        entries.clear();
+        for (uint32_t p : *c.entries) entries.push_back({p, 1});
+    }
+    if (c.index && c.video) {
+        Bytes idx = asfb::simple_index(c.interval_100ns, entries);
+        for (int k = 0; k < 4 && c.declared_entries; ++k) idx[52 + k] = uint8_t(c.declared_entries >> (8 * k));
+        f.trailing.push_back(idx);
+    }
+    return asfb::build(f);
+}
+
+int seek(Player& p, int dir, int64_t* t, int query = 0) { return hova_asff_demuxer.seek_time(p.ctx(), dir, t, query); }
+
+struct Frame {
+    int64_t pts;
+    uint32_t crc;
+    bool key;
+    bool operator==(const Frame& o) const { return pts == o.pts && crc == o.crc; }
+};
+using Frames = std::vector<Frame>;
+
+// Every object of a stream as the clip holds it (the last stays pending).
+Frames objects(const Clip& c, hova_stream_type_et t) {
+    Frames out;
+    for (uint32_t i = 0; i < c.packets; ++i)
+        out.push_back(t == kVideo ? Frame{i * 100000ll, delivery::crc(asfb::pattern(200, 0x5000 + i)), is_key(c, i)}
+                                  : Frame{(i * 100 + c.audio_lag_ms) * 1000, delivery::crc(asfb::pattern(100, 0xA000 + i)), true});
+    return out;
+}
+
+Frames committed(Player& p, hova_stream_type_et t, size_t from, size_t to) {
+    Frames out;
+    for (size_t i = from; i < to; ++i) {
+        const host::HostEvent& e = p.host.events()[i];
+        if (e.kind == host::EventKind::Commit && !e.packet_type && e.type == t) out.push_back({e.pts, e.crc32, false});
+    }
+    return out;
+}
+
+// Where a seek to `t` lands among `all`: the last key frame at or before it
+// backward (the first object when there is none), the first at or after it
+// forward (none: -1). Time 0 is the first object either way.
+int land(const Frames& all, int64_t t, int dir) {
+    int at = dir == B || t == 0 ? 0 : -1;
+    for (size_t i = 0; i < all.size() && t != 0; ++i)
+        if (all[i].key && (dir == B ? all[i].pts <= t : all[i].pts >= t && at < 0)) at = int(i);
+    return at;
+}
+
+// Many targets, both directions, with and without a usable index, in every
+// buffering mode, right after the open, during delivery (in separate parsing
+// when audio lies 3 s behind video) and after the end of the stream. A query
+// answers as the seek after it and changes nothing, a failed seek changes
+// nothing; an applied seek drops what was pending and delivery resumes with
+// the key frame found, byte for byte, and every frame after it; the other
+// stream resumes at the same packet, or in separate parsing at its own object
+// on the asked side.
+TEST(SeekSweep, LandsOnTheKeyFrameOnTheAskedSideInEveryMode) {
+    auto named = [](const char* n) { Clip c; c.name = n; return c; };
+    Clip late = named("late key frames, no index"), sparse = named("two key frames, 3 s announced"),
+         audio = named("audio only"), apart = named("audio 3 s late"), held = named("preroll, index read entry by entry"),
+         past = named("index past the data"), zero = named("index interval 0"), plain = named("no index");
+    late.key_first = 5, late.index = false;
+    sparse.packets = 40, sparse.key_every = 20, sparse.duration_100ns = 30000000, sparse.index = false;
+    audio.video = false;
+    apart.audio_lag_ms = 3000;
+    held.preroll_ms = 500, held.declared_entries = 11;
+    past.entries = std::vector<uint32_t>(10, 5000);
+    zero.interval_100ns = 0;
+    plain.index = false;
+    for (const Clip& c : {named("encoder index"), plain, late, sparse, audio, apart, held, past, zero}) {
+        const Bytes file = build(c);
+        const hova_stream_type_et own = c.video ? kVideo : kAudio, other = c.video ? kAudio : kVideo;
+        const Frames all = objects(c, own), others = c.audio && c.video ? objects(c, other) : Frames{};
+        for (int m = 0; m < 4; ++m)
+            for (int64_t target : {-700000ll, 0ll, 150000ll, 1807000ll, 2350000ll, 3000000ll, 4550000ll, 9200000ll, 60000000ll})
+                for (int dir : {B, F}) {
+                    // Forward, the index passes over a key frame at the target, and the first one after a target before it.
+                    if (c.index && (target == 3000000 || (target < 0 && dir == F))) continue;
+                    const int steps = std::vector<int>{0, 10, 100000}[size_t(target / 1000 + dir) % 3];
+                    SCOPED_TRACE(testing::Message() << c.name << ", " << host::buffering_name(host::kBufferings[m])
+                                                    << ", target " << target << ", dir " << dir << ", after " << steps);
+                    Player p(file, host::with_buffering(host::kBufferings[m]));
+                    p.open_or_fail();
+                    for (int i = 0; i < steps && p.step() != HOVA_EndOfStream; ++i) {}
+                    EXPECT_TRUE(!c.audio_lag_ms || steps != 10 || p.ctx()->parse_mode == PARSE_SEP);
+                    int64_t asked = target, t = target;
+                    const int rq = seek(p, dir, &asked, 1);
+                    for (int i = 0; i < 3; ++i) p.step();
+                    const size_t before = p.host.events().size();
+                    const int rc = seek(p, dir, &t);
+                    const bool sep = p.ctx()->parse_mode == PARSE_SEP;
+                    const size_t from = p.host.events().size();
+                    EXPECT_FALSE(rc == HOVA_OK && (p.host.pending(kVideo) || p.host.pending(kAudio)));
+                    p.play();
+                    const size_t end = p.host.events().size();
+                    EXPECT_EQ(rq, rc);
+                    EXPECT_EQ(asked, t);
+                    for (auto [ref, kind] : {std::pair{&all, own}, std::pair{&others, other}}) {
+                        if (ref->empty()) continue;
+                        const Frames head = committed(p, kind, 0, before), tail = committed(p, kind, from, end);
+                        ASSERT_LE(head.size(), ref->size());
+                        EXPECT_TRUE(std::equal(head.begin(), head.end(), ref->begin()));  // delivery so far
+                        if (rc != HOVA_OK) {  // goes on where it was
+                            ASSERT_EQ(head.size() + tail.size() + 1, ref->size());
+                            EXPECT_TRUE(std::equal(tail.begin(), tail.end(), ref->begin() + long(head.size())));
+                            continue;
+                        }
+                        const int at = kind == own || !sep ? land(all, t, dir) : land(*ref, t, dir);
+                        ASSERT_GE(at, 0);
+                        EXPECT_EQ(tail, Frames(ref->begin() + at, ref->end() - 1)) << (kind == own ? "own" : "other");
+                    }
+                    const int at = land(all, target, dir);
+                    EXPECT_EQ(rc, at < 0 ? HOVA_SeekFailed : HOVA_OK);
+                    EXPECT_EQ(t, at < 0 ? target : all[size_t(at)].pts);
+                    p.expect_clean_close();
+                }
+    }
+}
+
+// Every frame a key frame, so the index alone decides where a seek lands.
+// Entry 0's time is worked out from the first entry naming another packet;
+// the walk goes from the target's entry to the next one naming another
+// packet and steps on until the key frame lies on the asked side; an index
+// that cannot answer leaves the seek to the search without index.
+TEST(IndexSeek, WalksFromTheTargetsEntryToTheNextDistinctKeyFrame) {
+    const std::vector<uint32_t> even = {0, 10, 20, 25, 28, 40, 40, 70, 80, 90},
+                                early = {0, 0, 0, 0, 5, 30, 30, 30, 60, 60},  // entry 0 at -3.5 s
+                                late = {0, 0, 40, 40, 40, 45, 60, 70, 80, 90},  // entry 0 at +2 s
+                                one = std::vector<uint32_t>(10, 30);
+    const struct {
+        const std::vector<uint32_t>* entries;
+        int dir;
+        int64_t target, found, start_offset;
+    } cases[] = {
+        {&even, B, 2200000, 2000000, 0}, {&even, F, 2200000, 2500000, 0},
+        {&even, B, 2900000, 2500000, 0}, {&even, F, 2900000, 4000000, 0},
+        {&even, B, 2000000, 2000000, 0}, {&even, F, 2000000, 2500000, 0},  // passed over
+        {&even, B, 5500000, 4000000, 0}, {&even, F, 5500000, 7000000, 0},  // over the repeat
+        {&even, B, 9500000, 9000000, 0}, {&even, F, 9500000, 9500000, 0},  // by the search
+        {&even, B, -3000000, 0, 0},       {&early, B, 5800000, 3000000, -3500000},
+        {&early, B, 2900000, 500000, -3500000}, {&early, F, 2900000, 6000000, -3500000},
+        {&late, F, 5500000, 6000000, 2000000},  {&late, B, 5500000, 4000000, 2000000},
+        {&early, B, -3300000, 0, -3500000},     {&one, B, 4550000, 3000000, 0},
+        {&one, F, 4550000, 4600000, 0},  // by the search
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(testing::Message() << "dir " << c.dir << " target " << c.target);
+        Clip clip;
+        clip.key_every = 1, clip.entries = *c.entries;
+        Player p(build(clip));
+        p.open_or_fail();
+        int64_t t = c.target;
+        ASSERT_EQ(seek(p, c.dir, &t), HOVA_OK);
+        EXPECT_EQ(t, c.found);
+        EXPECT_EQ(p.ctx()->index_start_offset, c.start_offset);
+        ASSERT_EQ(p.play(), HOVA_EndOfStream);
+        ASSERT_FALSE(p.frames(kVideo).empty());
+        EXPECT_EQ(p.frames(kVideo).front().pts, c.found);
+        p.expect_clean_close();
+    }
+}
+
+// On a network input only the index is used, for video: without one the
+// input is not touched; a target it cannot answer fails; an index cut short
+// inside a run of repeats ends the run with the last entry read. Audio takes
+// the first object after one interpolated probe.
+TEST(IndexSeek, NetworkInputSeeksVideoOnlyThroughAnIndex) {
+    host::InputOptions net;
+    net.streaming = true, net.disable_cache = true;
+    Clip none, every, cut, audio;
+    none.index = false;
+    every.key_every = cut.key_every = 1, every.entries = {0, 10, 20, 25, 28, 40, 40, 70, 80, 90};
+    cut.entries = {0, 10, 25, 25}, cut.declared_entries = 10;
+    audio.video = false;
+    const struct {
+        const Clip* clip;
+        int dir;
+        int64_t target, found;
+        uint64_t first_read;  // packet of the first read, or 0 for none
+    } cases[] = {{&none, B, 2000000, -1, 0}, {&every, F, 9500000, -1, 0}, {&every, B, 2200000, 2000000, 0},
+                 {&cut, F, 2200000, 2500000, 0}, {&audio, B, 2350000, 2300000, 23}, {&audio, F, 2350000, 2300000, 23}};
+    for (const auto& c : cases) {
+        SCOPED_TRACE(testing::Message() << "dir " << c.dir << " target " << c.target);
+        Player p(build(*c.clip), net);
+        p.open_or_fail();
+        std::vector<uint64_t> reads;
+        p.input().faults().before_read = [&](uint64_t pos, size_t) { reads.push_back(pos); };
+        int64_t t = c.target;
+        EXPECT_EQ(seek(p, c.dir, &t), c.found < 0 ? HOVA_SeekFailed : HOVA_OK);
+        EXPECT_EQ(t, c.found < 0 ? c.target : c.found);
+        EXPECT_TRUE(c.clip != &none || reads.empty());
+        if (c.first_read) {
+            ASSERT_FALSE(reads.empty());
+            EXPECT_EQ(reads.front(), p.ctx()->first_packet + 1024 * c.first_read);
+        }
+        if (c.found >= 0) {
+            ASSERT_EQ(p.play(), HOVA_EndOfStream);
+            EXPECT_EQ(p.frames(c.clip->video ? kVideo : kAudio).front().pts, c.found);
+        }
+        p.expect_clean_close();
+    }
+}
+
+// -1 only flushes the reader; any other time drops what delivery was
+// assembling, hands the time in milliseconds to the input and reads on from
+// wherever the input then stands, with or without the streaming thread.
+TEST(Resync, FlushOnlyForMinusOneOtherwiseRestartAtTheInputsPosition) {
+    const struct {
+        int64_t time;
+        bool host_seek_time;
+        std::vector<int> host_gets;  // what the input's seek_time receives
+    } cases[] = {{-1, true, {-1}}, {1999, true, {1}}, {-1500, true, {-1}}, {0, true, {0}}, {5000000, false, {}}};
+    for (const auto& c : cases)
+        for (bool thread : {false, true}) {
+            if (thread && !c.host_seek_time) continue;  // a threaded input moves only by its time seek
+            SCOPED_TRACE(testing::Message() << "time " << c.time << ", thread " << thread);
+            Clip clip;
+            clip.index = false;
+            host::InputOptions in;
+            if (thread) in.rbuf_mode = CBIO_APPLY_RBUF, in.use_thread = true, in.block_size = 700;
+            Player p(build(clip), in, 4096);
+            p.input().set_seek_time_available(c.host_seek_time);
+            p.open_or_fail();
+            for (int i = 0; i < 7; ++i) ASSERT_EQ(p.step(), HOVA_OK);
+            ASSERT_TRUE(p.host.pending(kVideo));
+            asf_demuxer_st* d = p.ctx();
+            const uint64_t packets = d->cur_packets, moved_to = d->first_packet + 40u * 1024u;
+            const asf_packet_st cursor = d->cur_data_packet;
+            if (c.host_seek_time)  // the host moves its input to packet 40, as its own time seek would
+                p.input().time_to_position = [&](int) { return int64_t(moved_to); };
+            else
+                ASSERT_EQ(p.input().io()->seek(p.input().io(), cb_off_t(moved_to), CB_SEEK_SET), cb_off_t(moved_to));
+            const size_t events = p.host.events().size();
+            ASSERT_EQ(hova_asff_demuxer.resync_time(d, c.time), HOVA_OK);
+            EXPECT_EQ(p.input().counters().seek_times, c.host_gets);
+            EXPECT_EQ(d->s.cbuffer.curpos, moved_to);
+            EXPECT_EQ(d->cur_packets, packets);
+            if (c.time == -1) {
+                EXPECT_EQ(p.host.events().size(), events);
+                EXPECT_TRUE(p.host.pending(kVideo));
+                EXPECT_EQ(std::memcmp(&d->cur_data_packet, &cursor, sizeof cursor), 0);
+            } else {
+                EXPECT_FALSE(p.host.pending(kVideo) || p.host.pending(kAudio));
+                EXPECT_EQ(d->cur_data_packet.num_payloads, 0u);
+                EXPECT_EQ(d->cur_data_packet.parsed_size, 0u);
+                EXPECT_EQ(d->cur_data_packet.num, packets);
+                const size_t from = p.host.events().size();
+                ASSERT_EQ(p.play(), HOVA_EndOfStream);  // on at packet 40, whole frames only
+                const Frames v = committed(p, kVideo, from, p.host.events().size());
+                ASSERT_FALSE(v.empty());
+                EXPECT_EQ(v.front().pts, 4000000);
+            }
+            p.expect_clean_close();
+        }
+}
+
+// Packet 0: an audio start, a video start without key flag, a key-flagged
+// video continuation, a key frame of an inactive stream, then a key frame.
+// Packet 1: audio only, compressed. Packet 2: a key frame. Preroll 150 ms.
+// Only object starts of the wanted kind give a time (video: key frames);
+// after a packet's last payload the reader stands on the next packet.
+TEST(TimestampProbe, GivesTimesOnlyForObjectStartsOfTheWantedKind) {
+    asfb::PacketFile f;
+    f.preroll_ms = 150;
+    f.packets = {asfb::packet({asfb::media(1, 1, 0, 30, 100, asfb::pattern(30, 1)), asfb::media(2, 1, 0, 40, 110, asfb::pattern(40, 2)),
+                               asfb::media(2, 2, 20, 60, 115, asfb::pattern(40, 3), true),
+                               asfb::media(5, 1, 0, 30, 118, asfb::pattern(30, 4), true),
+                               asfb::media(2, 3, 0, 40, 120, asfb::pattern(40, 5), true)}, 1024),
+                 asfb::packet({asfb::compressed(1, 2, 200, 10, {asfb::pattern(20, 6), asfb::pattern(25, 7)})}, 1024),
+                 asfb::packet({asfb::media(2, 4, 0, 40, 400, asfb::pattern(40, 8), true)}, 1024)};
+    for (auto [kind, times] : {std::pair{kAudio, std::vector<int64_t>{-50000, -1, -1, -1, -1, 50000, -1}},
+                               std::pair{kVideo, std::vector<int64_t>{-1, -1, -1, -1, -30000, -1, 250000}}}) {
+        Player p(asfb::build_packet_file(f));
+        p.open_or_fail();
+        asf_demuxer_st* d = p.ctx();
+        asf_packet_st cursor{};
+        for (size_t step = 0; step < times.size(); ++step) {
+            int64_t t = 7;
+            ASSERT_EQ(get_packet_pts(d, &cursor, &t, kind), HOVA_OK) << "step " << step;
+            EXPECT_EQ(t, times[step]) << "step " << step;
+            EXPECT_EQ(cb_tell64(&d->s.cbuffer) - d->first_packet, step < 4 ? cb_tell64(&d->s.cbuffer) - d->first_packet : 1024 * (step - 3));
+        }
+        int64_t t = 7;
+        EXPECT_EQ(get_packet_pts(d, &cursor, &t, kind), HOVA_EndOfStream);  // no time at the end
+        EXPECT_EQ(t, -1);
+        p.expect_clean_close();
+    }
+}
+
+}  // namespace
