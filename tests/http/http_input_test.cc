@@ -48,7 +48,7 @@ int seek_to_frame(corpus::Player& p, int64_t* t) {
 struct Played {
     int seek_rc = -1;
     std::vector<std::string> events;  // after the open's answer and where the seek went
-    uint64_t requests = 0;
+    uint64_t requests = 0, bytes = 0;
     std::string failure;
 };
 
@@ -70,7 +70,8 @@ Played play(std::unique_ptr<RawInput> input, int64_t seek_us = -1, uint64_t max 
     out.events.insert(out.events.begin(), head);
     p.s.close();
     EXPECT_EQ(p.s.blocks_outstanding(), 0u);
-    if (http) out.requests = http->stats().requests, out.failure = http->failure();
+    if (http) out.requests = http->stats().requests, out.bytes = http->stats().bytes_received;
+    if (http) out.failure = http->failure();
     return out;
 }
 
@@ -102,6 +103,7 @@ TEST(HttpInput, EveryCorpusFileByUrlGivesTheFileEventsInEveryModeAlsoAfterASeek)
             EXPECT_EQ(net.events, local.events);
             EXPECT_EQ(net.failure, "");
             EXPECT_LE(net.requests, 3u) << "the first, at most a jump to the index and one back";
+            EXPECT_LE(net.bytes * 4, testenv::read_file_or_empty(path).size() * 5) << "each byte about once";
             if (whole.rc != HOVA_OK || last_pts <= 0) continue;
             const Played sn = play(input(url, b), last_pts / 2, 200),
                          sl = play(input(path, b), last_pts / 2, 200);
