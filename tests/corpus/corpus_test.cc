@@ -216,8 +216,8 @@ TEST(CorpusInfo, AgreesWithFfprobe) {
         SCOPED_TRACE(path);
         const json ref = load_ref(path);
         std::string dump;
-        const int rc = testenv::run_command("'" + std::string(testenv::asfdump_path()) + "' info --plugin '" +
-                                                testenv::plugin_path() + "' '" + path + "' 2>&1", &dump);
+        const std::string tool = testenv::asfdump_path(), plugin = testenv::plugin_path();
+        const int rc = testenv::run_command("'" + tool + "' info --plugin '" + plugin + "' '" + path + "' 2>&1", &dump);
         if (ref.is_null()) {  // the damaged file
             EXPECT_EQ(rc, 1);
             EXPECT_NE(dump.find("HOVA_OpenFailed"), std::string::npos) << dump;
