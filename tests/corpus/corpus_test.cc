@@ -1,8 +1,8 @@
 // The real files of the corpus against ffprobe's view of them: every active
-// stream's frames (sizes, times, CRCs) and the
-// information answers in every buffering mode, a file changed by one field,
-// the information records (asfdump info), and seek sweeps landing on a
-// reference key frame on the asked side. Files are read in place; the tests
+// stream's frames (sizes, times, CRCs) and the information answers in every
+// buffering mode, a file changed by one field, the information records
+// (asfdump info), and seek sweeps landing on a reference key frame on the
+// asked side. Files are read in place; the tests
 // skip when they are absent.
 #include <zlib.h>
 
@@ -131,8 +131,8 @@ class CorpusDelivery : public testing::TestWithParam<std::string> {};
 
 // Every active stream's frames against ffprobe's packets (every object but the
 // last, which stays pending), the same answers and events in every buffering
-// mode (also for one file changed by one field). Damaged input (no reference) leaves nothing
-// behind and plays to its end when it opens.
+// mode (also for one file changed by one field). Damaged input (no reference)
+// leaves nothing behind and plays to its end when it opens.
 TEST_P(CorpusDelivery, FramesMatchTheReferenceInEveryBufferingMode) {
     REQUIRE_CORPUS_FILE(path, GetParam());
     const std::vector<uint8_t> file = testenv::read_file_or_empty(path);
