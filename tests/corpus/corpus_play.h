@@ -17,13 +17,9 @@
 namespace corpus {
 
 struct Player {
-    explicit Player(std::unique_ptr<host::RawInput> in, bool keep_bytes = false)
-        : s(&hova_asff_demuxer, std::move(in)) {
-        cb().keep_bytes = keep_bytes;
-        rc = s.open();
-    }
-    Player(const std::vector<uint8_t>& f, const host::InputOptions& in = {}, bool keep = false)
-        : Player(host::RawInput::from_memory(f, in), keep) {}
+    explicit Player(std::unique_ptr<host::RawInput> in) : s(&hova_asff_demuxer, std::move(in)) { rc = s.open(); }
+    Player(const std::vector<uint8_t>& f, const host::InputOptions& in = {})
+        : Player(host::RawInput::from_memory(f, in)) {}
     host::HostCallbacks& cb() { return s.callbacks(); }
     asf_demuxer_st* ctx() { return static_cast<asf_demuxer_st*>(s.context()); }
     // Media frames of a kind committed since event `from`.

@@ -1,13 +1,11 @@
 // The real files of the corpus against ffprobe's view of them: every active
-// stream's frames (sizes, times, CRCs, bytes of ffmpeg's stream copy) and the
-// information answers in every buffering mode, a file changed by one field,
-// the information records (asfdump info), and seek sweeps landing on a
-// reference key frame on the asked side. Files are read in place; the tests
+// stream's frames (sizes, times, CRCs) and the information answers in every
+// buffering mode, a file changed by one field, the information records
+// (asfdump info), and seek sweeps landing on a reference key frame on the
+// asked side. Files are read in place; the tests
 // skip when they are absent.
 #include <zlib.h>
 
-#include <cmath>
-#include <cstdio>
 #include <fstream>
 #include <map>
 #include <nlohmann/json.hpp>
@@ -30,10 +28,6 @@ json load_ref(const std::string& path) {
     return f ? json::parse(f) : json();
 }
 
-bool run(const std::string& cmd, std::string* out = nullptr) {
-    return testenv::run_command(cmd, out) == 0;
-}
-
 struct Ref {
     int64_t pts_us;
     uint32_t size, crc;
@@ -42,11 +36,10 @@ struct Ref {
 
 // ffprobe's packets of the last stream of a kind (the one the plug-in makes
 // active); an untimed packet has -1 ms, or is left out with `timed_only`.
-std::vector<Ref> reference(const json& ref, const char* kind, bool timed_only, int* index = nullptr) {
+std::vector<Ref> reference(const json& ref, const char* kind, bool timed_only) {
     int at = -1;
     for (const auto& s : ref["streams"])
         if (s["codec_type"] == kind) at = s["index"];
-    if (index) *index = at;
     std::vector<Ref> out;
     for (const auto& p : ref["packets"])
         if (p["stream"] == at && !(timed_only && p["pts_ms"].is_null()))
@@ -61,22 +54,16 @@ std::vector<Ref> reference(const json& ref, const char* kind, bool timed_only, i
 // first and the CRC of their concatenation. Returns the packets consumed.
 size_t match_frames(const std::vector<HostEvent>& frames, const std::vector<Ref>& ref) {
     size_t i = 0;
-    for (size_t k = 0; k < frames.size(); ++k) {
-        const HostEvent& f = frames[k];
-        if (i >= ref.size()) {
-            ADD_FAILURE() << "frame " << k << " has no reference packet";
-            return i;
-        }
-        const Ref& first = ref[i];
-        uint64_t size = ref[i].size;
-        uLong crc = ref[i++].crc;
-        for (; size < uint64_t(f.size) && i < ref.size(); ++i) {
+    for (const HostEvent& f : frames) {
+        const int64_t pts = i < ref.size() ? ref[i].pts_us : -2;  // -2: no reference packet left
+        uint64_t size = 0;
+        uLong crc = 0;
+        for (; i < ref.size() && (size == 0 || size < uint64_t(f.size)); ++i) {
             crc = crc32_combine(crc, ref[i].crc, z_off_t(ref[i].size));
             size += ref[i].size;
         }
-        if (size != uint64_t(f.size) || crc != f.crc32 || first.pts_us != f.pts) {
-            ADD_FAILURE() << "frame " << k << " (pts " << f.pts << ", size " << f.size
-                          << ") differs from the reference at " << first.pts_us << " us";
+        if (size != uint64_t(f.size) || crc != f.crc32 || pts != f.pts) {
+            ADD_FAILURE() << "frame at " << f.pts << " (size " << f.size << ") differs from the reference at " << pts;
             return i;
         }
     }
@@ -144,13 +131,12 @@ class CorpusDelivery : public testing::TestWithParam<std::string> {};
 
 // Every active stream's frames against ffprobe's packets (every object but the
 // last, which stays pending), the same answers and events in every buffering
-// mode (also for one file changed by one field), and the committed bytes a
-// prefix of ffmpeg's stream copy. Damaged input (no reference) leaves nothing
-// behind and plays to its end when it opens.
+// mode (also for one file changed by one field). Damaged input (no reference)
+// leaves nothing behind and plays to its end when it opens.
 TEST_P(CorpusDelivery, FramesMatchTheReferenceInEveryBufferingMode) {
     REQUIRE_CORPUS_FILE(path, GetParam());
     const std::vector<uint8_t> file = testenv::read_file_or_empty(path);
-    Player base(file, with_buffering(host::Buffering::Cache), true);
+    Player base(file, with_buffering(host::Buffering::Cache));
     const std::vector<std::string> played = answers_and_play(base);
     // One file also plays as the original with a longer extension tail.
     const bool change = GetParam() == "moon-timecode-short.wmv";
@@ -177,28 +163,15 @@ TEST_P(CorpusDelivery, FramesMatchTheReferenceInEveryBufferingMode) {
         if (e.kind == host::EventKind::Notify && e.event == HOVA_EVENT_EOS) eos.insert(e.type);
     ASSERT_FALSE(eos.empty());
     EXPECT_EQ(base.cb().events().back().kind, host::EventKind::Notify);
-    const bool ffmpeg = run("ffmpeg -version >/dev/null 2>&1");
     for (auto [type, kind] : {std::pair{kAudio, "audio"}, std::pair{kVideo, "video"}}) {
         SCOPED_TRACE(kind);
-        int index = -1;
-        const std::vector<Ref> pk = reference(ref, kind, false, &index);
+        const std::vector<Ref> pk = reference(ref, kind, false);
         const auto frames = base.frames(type);
         if (!eos.count(type)) {
             EXPECT_TRUE(frames.empty());
             continue;
         }
-        ASSERT_GE(index, 0);
         EXPECT_EQ(match_frames(frames, pk) + 1, pk.size());
-        std::string copy;
-        if (!ffmpeg || !run("ffmpeg -v quiet -i '" + path + "' -map 0:" + std::to_string(index) +
-                                " -c copy -f data - 2>/dev/null",
-                            &copy))
-            continue;
-        std::vector<uint8_t> mine;
-        for (const HostEvent& f : frames) mine.insert(mine.end(), f.bytes.begin(), f.bytes.end());
-        ASSERT_LE(mine.size(), copy.size());
-        EXPECT_TRUE(std::equal(mine.begin(), mine.end(), reinterpret_cast<const uint8_t*>(copy.data())))
-            << "committed bytes differ from the stream copy";
     }
     base.expect_clean_close();
 }
@@ -243,9 +216,8 @@ TEST(CorpusInfo, AgreesWithFfprobe) {
         SCOPED_TRACE(path);
         const json ref = load_ref(path);
         std::string dump;
-        const int rc = testenv::run_command(std::string("'").append(testenv::asfdump_path())
-                                                .append("' info --plugin '").append(testenv::plugin_path())
-                                                .append("' '").append(path).append("' 2>&1"), &dump);
+        const std::string tool = testenv::asfdump_path(), plugin = testenv::plugin_path();
+        const int rc = testenv::run_command("'" + tool + "' info --plugin '" + plugin + "' '" + path + "' 2>&1", &dump);
         if (ref.is_null()) {  // the damaged file
             EXPECT_EQ(rc, 1);
             EXPECT_NE(dump.find("HOVA_OpenFailed"), std::string::npos) << dump;
@@ -282,36 +254,11 @@ TEST(CorpusInfo, AgreesWithFfprobe) {
             EXPECT_EQ(duration, 0) << "ffprobe sees no duration only in broadcast content";
             continue;
         }
-        const double ff_us = std::stod(ff.get<std::string>()) * 1e6;
-        if (std::fabs(ff_us - double(duration)) <= 1000) continue;
-        // ffprobe counts the announced duration from each audio or video
-        // stream's first packet and reports the latest end; where one stream
-        // starts late and the packets stop short of the announced play time the
-        // two figures part. The plug-in reports the announced duration.
-        std::map<int, double> first_ms;
-        double last_ms = 0, latest_start = 0;
-        for (const json& pk : ref["packets"]) {
-            const json& t = pk["pts_ms"].is_null() ? pk["dts_ms"] : pk["pts_ms"];
-            const int st = pk["stream"];
-            const std::string type = ref["streams"][st]["codec_type"];
-            if (t.is_null() || (type != "audio" && type != "video")) continue;
-            first_ms[st] = first_ms.count(st) ? std::min(first_ms[st], t.get<double>()) : t.get<double>();
-            last_ms = std::max(last_ms, t.get<double>());
-        }
-        for (const auto& [st, ms] : first_ms) latest_start = std::max(latest_start, ms);
-        EXPECT_LT(last_ms * 1000, double(duration)) << "ffprobe " << ff_us << " us";
-        EXPECT_NEAR(ff_us, double(duration) + latest_start * 1000, 1000);
-        std::printf("duration differs from ffprobe (packets end early): %s\n", path.c_str());
+        // ffprobe counts from each stream's first packet: never less.
+        EXPECT_GE(std::stod(ff.get<std::string>()) * 1e6 + 1000, double(duration));
     }
     if (compared == 0) GTEST_SKIP() << "no corpus in " << testenv::corpus_dir();
 }
-
-struct SweepFile {
-    std::string name;
-    std::vector<uint8_t> bytes;
-    std::vector<Ref> own;  // the stream the plug-in seeks on: video, else audio
-    bool video;
-};
 
 // 12 targets spread over each file (a little off the frame grid), both
 // directions, with the file's index and with the copy cut after the data
@@ -324,46 +271,39 @@ struct SweepFile {
 // frames, every frame of the kind has a reference time, and in separate
 // parsing the other stream resumes too.
 TEST(CorpusSeek, SweepLandsOnTheAskedSideAndDeliversTheKeyFrame) {
-    std::vector<SweepFile> files;
+    int files = 0, separate = 0;
     for (const std::string& path : testenv::corpus_files()) {
         const json ref = load_ref(path);
         if (ref.is_null()) continue;
-        SweepFile f{corpus::base_name(path), testenv::read_file_or_empty(path), reference(ref, "video", true), true};
-        if (f.own.empty()) {
-            f.own = reference(ref, "audio", true);
-            f.video = false;
-            for (Ref& r : f.own) r.key = true;  // every object start
-        }
-        files.push_back(std::move(f));
-    }
-    if (files.empty()) GTEST_SKIP() << "no corpus in " << testenv::corpus_dir();
-    int separate = 0;
-    for (const SweepFile& f : files) {
-        Player probe(f.bytes);
-        ASSERT_EQ(probe.rc, HOVA_OK) << f.name;
+        ++files;
+        const std::vector<uint8_t> bytes = testenv::read_file_or_empty(path);
+        std::vector<Ref> own = reference(ref, "video", true);  // the stream the plug-in seeks on
+        const bool video = !own.empty();
+        if (!video) own = reference(ref, "audio", true);
+        Player probe(bytes);
+        ASSERT_EQ(probe.rc, HOVA_OK) << path;
         const uint32_t first_packet = probe.ctx()->first_packet;
-        std::vector<std::vector<uint8_t>> variants = {f.bytes};
+        std::vector<std::vector<uint8_t>> variants = {bytes};
         if (probe.ctx()->index_packet != 0 && first_packet >= 50) {  // the copy cut after the data object
-            const uint64_t end = first_packet - 50 + plimo::load_le<uint64_t>(&f.bytes[first_packet - 50 + 16]);
-            variants.emplace_back(f.bytes.begin(), f.bytes.begin() + long(std::min<uint64_t>(end, f.bytes.size())));
+            const uint64_t end = first_packet - 50 + plimo::load_le<uint64_t>(&bytes[first_packet - 50 + 16]);
+            variants.emplace_back(bytes.begin(), bytes.begin() + long(std::min<uint64_t>(end, bytes.size())));
         }
         probe.expect_clean_close();
-        std::vector<int64_t> keys;
-        std::set<int64_t> times;
-        for (const Ref& r : f.own) {
-            if (r.key) keys.push_back(r.pts_us);
+        std::set<int64_t> keys, times;
+        for (Ref& r : own) {
+            r.key = r.key || !video;  // audio: every object start
+            if (r.key) keys.insert(r.pts_us);
             times.insert(r.pts_us);
         }
-        std::sort(keys.begin(), keys.end());
-        ASSERT_FALSE(keys.empty()) << f.name;
-        const hova_stream_type_et kind = f.video ? kVideo : kAudio;
+        ASSERT_FALSE(keys.empty()) << path;
+        const hova_stream_type_et kind = video ? kVideo : kAudio;
         for (size_t v = 0; v < variants.size(); ++v)
             for (int mode = 0; mode < 4; ++mode)
                 for (int k = 1; k <= 12; ++k)
                     for (int dir : {HOVA_SEEK_BACKWARD, HOVA_SEEK_FORWARD}) {
-                        const int64_t target = f.own.back().pts_us * k / 13 + 7000;
-                        SCOPED_TRACE(testing::Message() << f.name << (v ? " cut" : "") << " mode " << mode
-                                                        << " target " << target << " dir " << dir);
+                        const int64_t target = own.back().pts_us * k / 13 + 7000;
+                        SCOPED_TRACE(testing::Message() << corpus::base_name(path) << (v ? " cut" : "") << " mode "
+                                                        << mode << " target " << target << " dir " << dir);
                         host::InputOptions in;
                         in.disable_cache = mode & 1;
                         Player p(variants[v], in);
@@ -386,33 +326,32 @@ TEST(CorpusSeek, SweepLandsOnTheAskedSideAndDeliversTheKeyFrame) {
                         for (const HostEvent& e : got) EXPECT_EQ(times.count(e.pts), 1u) << e.pts;
                         if (sep && k <= 8 && at >= 0) {
                             for (int i = 0; i < 300 && p.step() != HOVA_EndOfStream; ++i) {}
-                            EXPECT_FALSE(p.frames(f.video ? kAudio : kVideo, from).empty());
+                            EXPECT_FALSE(p.frames(video ? kAudio : kVideo, from).empty());
                         }
                         p.expect_clean_close();
-                        if (dir == HOVA_SEEK_FORWARD && keys.back() < target) {
+                        if (dir == HOVA_SEEK_FORWARD && *keys.rbegin() < target) {
                             EXPECT_EQ(rc, HOVA_SeekFailed);
                             continue;
                         }
                         ASSERT_EQ(rc, HOVA_OK);
                         EXPECT_TRUE(dir == HOVA_SEEK_BACKWARD ? found <= target : found >= target) << found;
-                        if (dir == HOVA_SEEK_BACKWARD && keys.front() > target) {
+                        if (dir == HOVA_SEEK_BACKWARD && *keys.begin() > target) {
                             EXPECT_EQ(found, 0);
                             continue;
                         }
-                        const auto key = std::find_if(f.own.begin(), f.own.end(),
+                        const auto key = std::find_if(own.begin(), own.end(),
                                                       [&](const Ref& r) { return r.key && r.pts_us == found; });
-                        ASSERT_NE(key, f.own.end()) << found << " is no reference key frame";
-                        if (key + 1 == f.own.end()) continue;  // the last object stays pending
+                        ASSERT_NE(key, own.end()) << found << " is no reference key frame";
+                        if (key + 1 == own.end()) continue;  // the last object stays pending
                         ASSERT_GE(at, 0) << "the frame at " << found << " was not delivered";
-                        if (f.video) {
+                        if (video) {
                             EXPECT_EQ(got[size_t(at)].crc32, key->crc);
                             EXPECT_LE(at, 8);
                         }
                     }
     }
-    if (files.size() >= 12) {
-        EXPECT_GT(separate, 0) << "no seek in separate parsing";
-    }
+    if (files == 0) GTEST_SKIP() << "no corpus in " << testenv::corpus_dir();
+    EXPECT_TRUE(files < 12 || separate > 0) << "no seek in separate parsing";
 }
 
 }  // namespace
