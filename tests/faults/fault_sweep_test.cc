@@ -60,7 +60,7 @@ Use session(const Bytes& file, host::Buffering b, const std::function<void(Playe
     p.expect_clean_close();
     for (auto t : {HOVA_STREAM_AUDIO, HOVA_STREAM_VIDEO})
         for (const auto& e : p.frames(t)) u.frames.insert({e.pts, e.crc32});
-    u.mallocs = p.host.malloc_calls(), u.allocs = p.alloc_calls, u.reallocs = p.realloc_calls;
+    u.mallocs = p.host.malloc_calls(), u.allocs = p.calls[0], u.reallocs = p.calls[1];
     u.seeks = p.input().counters().seeks, u.reads = p.input().counters().reads;
     u.size = file.size();
     return u;
@@ -104,9 +104,9 @@ const Kind kKinds[] = {
     {"malloc fails", [](const Use& u) { return u.mallocs; },
      [](Player& p, uint64_t n) { p.host.fail_malloc_at(n); }, 1, 1},
     {"stream_alloc refused", [](const Use& u) { return u.allocs; },
-     [](Player& p, uint64_t n) { p.refuse_alloc_at(n); }, 1, 2},
+     [](Player& p, uint64_t n) { p.refuse_at(0, n); }, 1, 2},
     {"stream_realloc refused", [](const Use& u) { return u.reallocs; },
-     [](Player& p, uint64_t n) { p.refuse_realloc_at(n); }, 1, 2},
+     [](Player& p, uint64_t n) { p.refuse_at(1, n); }, 1, 2},
     {"seeks fail after", [](const Use& u) { return u.seeks; },
      [](Player& p, uint64_t n) { p.input().faults().fail_seeks_after = int64_t(n) - 1; }},
     {"reads end after", [](const Use& u) { return u.reads; },
