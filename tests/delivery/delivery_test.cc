@@ -81,12 +81,9 @@ void switch_off(Player& p, hova_stream_type_et off, int at) {
     for (const auto& c : calls)
         EXPECT_EQ(hova_asff_demuxer.set_track(p.ctx(), c.type, c.index, 1, HOVA_INPUT_MASTER),
                   c.result) << c.type << " " << c.index;
-    const int* active = p.ctx()->s.active_stream;
-    EXPECT_EQ(active[AUD] < 0, off == HOVA_STREAM_AUDIO);
-    EXPECT_EQ(active[VID] < 0, off == HOVA_STREAM_VIDEO);
-    auto& ev = p.host.events();
-    ev.erase(std::remove_if(ev.begin(), ev.end(), [&](auto& e) { return e.type == off; }),
-             ev.end());
+    EXPECT_EQ(p.ctx()->s.active_stream[AUD] < 0, off == HOVA_STREAM_AUDIO);
+    EXPECT_EQ(p.ctx()->s.active_stream[VID] < 0, off == HOVA_STREAM_VIDEO);
+    std::erase_if(p.host.events(), [&](auto& e) { return e.type == off; });
     EXPECT_EQ(p.ctx()->parse_mode, PARSE_SEQ);
     EXPECT_EQ(p.ctx()->accept_stream_type, HOVA_STREAM_NONE);
 }
@@ -129,18 +126,15 @@ std::vector<Shape> shapes() {
                                       : asfb::untimed(1, 1, 0, o, t.rep);
         s.push_back({"time " + std::to_string(t.want),
                      av_file({packet({first, media(1, 2, 0, 10, t.ms + 50, pattern(10, 2))}, 1024)},
-                           1024, [&](asfb::PacketFile& f) {
-                               f.preroll_ms = t.preroll, f.audio_time_offset = t.offset;
-                           }),
+                             1024, [&](auto& f) { f.preroll_ms = t.preroll, f.audio_time_offset = t.offset; }),
                      {{1, t.want, o}}});
     }
-    const Bytes v5 = pattern(200, 5);
     s.push_back({"video joined in an object's middle",
                  av_file({packet({media(2, 4, 100, 300, 0, pattern(200, 4)),
                                   media(1, 1, 0, 50, 0, pattern(50, 1))}, 1024),
-                          packet({media(2, 5, 0, 200, 40, v5, true),
+                          packet({media(2, 5, 0, 200, 40, pattern(200, 5), true),
                                   media(2, 6, 0, 20, 80, pattern(20, 6))}, 1024)}),
-                 {{2, 40000, v5}}});
+                 {{2, 40000, pattern(200, 5)}}});
     s.push_back({"other streams skipped",
                  av_file({packet({media(5, 1, 0, 100, 0, pattern(100, 1)),
                                   media(1, 1, 0, 10, 0, pattern(10, 3)),
@@ -236,23 +230,18 @@ std::vector<Shape> shapes() {
     s.push_back({"no packets", av_file({}, 1024, [](auto& f) { f.packet_count = 0; }), {}});
     // Spread audio written back column by column; as received when the size
     // does not match or the host refuses the memory.
-    const struct { uint8_t span; uint16_t plen, clen; Bytes got, want; const char* log; } spread[] =
-    {
+    const struct { uint8_t span; uint16_t plen, clen; Bytes got, want; const char* log; } spread[] = {
         {2, 4, 2, chunks({0, 1, 2, 3}), chunks({0, 2, 1, 3}), ""},
         {3, 4, 2, chunks({0, 1, 2, 3, 4, 5}), chunks({0, 3, 1, 4, 2, 5}), ""},
         {1, 4, 2, chunks({0, 1, 2, 3}), chunks({0, 1, 2, 3}), ""},
         {3, 4, 2, pattern(11, 3), pattern(11, 3), "object size 11 does not match spread len 3 x 4"},
         {3, 4, 2, pattern(12, 3), pattern(12, 3), "realloc for audio spread fails"},
-        {5, 1000, 100, asfb::spread_scramble(pattern(5000, 4), 5, 1000, 100), pattern(5000, 4),
-         ""}};
+        {5, 1000, 100, asfb::spread_scramble(pattern(5000, 4), 5, 1000, 100), pattern(5000, 4), ""}};
     for (const auto& r : spread) {
-        const uint32_t n = uint32_t(r.got.size());
         const bool refuse = r.log[0] == 'r';
-        s.push_back({"spread", av_file({packet({media(1, 1, 0, n, 100, r.got),
-                                              media(1, 2, 0, 4, 200, a)}, 6000)}, 6000,
-                                     [&](asfb::PacketFile& f) {
-                                         f.video = false, f.spread = {r.span, r.plen, r.clen};
-                                     }),
+        const auto audio = [&](auto& f) { f.video = false, f.spread = {r.span, r.plen, r.clen}; };
+        s.push_back({"spread", av_file({packet({media(1, 1, 0, uint32_t(r.got.size()), 100, r.got),
+                                                media(1, 2, 0, 4, 200, a)}, 6000)}, 6000, audio),
                      {{1, 100000, r.want}}, 0, 0, 1,
                      [refuse](Player& p) { p.host.refuse_stream_realloc = refuse; }, r.log});
     }
@@ -265,11 +254,9 @@ std::vector<Shape> shapes() {
         for (const auto& o : th)
             if (o.pts_ms < 13000 && (interval < 0 || o.pts_ms % 5000 == 0 || o.pts_ms == 12000))
                 w.push_back({2, o.pts_ms * 1000, o.data});
-        s.push_back({"thumbnails",
-                     av_file(mux(th, 1024), 1024, [](auto& f) { f.audio = false; }), w, 0,
-                     interval < 0 ? 0u : 5u, 2, [interval](Player& p) {
-                         hova_asff_demuxer.set_multi_thumb(p.ctx(), interval);
-                     }});
+        s.push_back({"thumbnails", av_file(mux(th, 1024), 1024, [](auto& f) { f.audio = false; }), w, 0,
+                     interval < 0 ? 0u : 5u, 2,
+                     [interval](Player& p) { hova_asff_demuxer.set_multi_thumb(p.ctx(), interval); }});
     }
     // A refused configuration is sent again on the next call.
     s.push_back({.what = "configuration refused",
