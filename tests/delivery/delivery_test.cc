@@ -155,16 +155,13 @@ std::vector<Shape> shapes() {
                                   compressed(1, 1, 0, 20, {a}), compressed(1, 2, 20, 20, {b}),
                                   compressed(1, 3, 40, 20, {a})}, 1024)}),
                  {{1, 0, a}, {1, 20000, b}}});
+    const auto six = [](uint32_t i) { return media(1, i + 1, 0, 100, i * 10, pattern(100, i)); };
     for (auto how : {asfb::Damage::PacketLenTooLong, asfb::Damage::PaddingTooLong,
                      asfb::Damage::NoPayloads, asfb::Damage::PayloadTooLong}) {
         std::vector<Bytes> packets;
-        std::vector<Want> want = {};
-        for (uint32_t i = 0; i < 6; ++i) {
-            const auto p = media(1, i + 1, 0, 100, i * 10, pattern(100, i));
-            packets.push_back(i == 2 ? asfb::damaged_packet(how, {p}, 512) : one(p, 512));
-            if (i != 2 && i != 5) want.push_back({1, i * 10000, p.data});
-        }
-        s.push_back({"damaged packet " + std::to_string(int(how)), av_file(packets, 512), want, 1});
+        for (uint32_t i = 0; i < 6; ++i) packets.push_back(i == 2 ? asfb::damaged_packet(how, {six(i)}, 512) : one(six(i), 512));
+        s.push_back({"damaged packet " + std::to_string(int(how)), av_file(packets, 512),
+                     {{1, 0, six(0).data}, {1, 10000, six(1).data}, {1, 30000, six(3).data}, {1, 40000, six(4).data}}, 1});
     }
     // Packet and payload header layouts; packets keep padding so a misplaced end shows.
     std::vector<Object> objs;
@@ -176,20 +173,14 @@ std::vector<Shape> shapes() {
         {true, true, 0, 0, 2, 1, 3, 1, 2},  {false, true, 0, 1, 2, 1, 3, 1, 3},
         {true, true, 3, 2, 1, 2, 2, 3, 2},  {true, false, 0, 3, 2, 1, 3, 1, 2},
         {false, false, 2, 0, 0, 1, 3, 2, 2}};
-    for (const auto& l : layouts) {
-        asfb::PacketLayout pl;
-        pl.error_correction = l.ec, pl.multiple = l.multiple, pl.packet_len_type = l.len;
-        pl.sequence_type = l.seq, pl.padding_len_type = l.pad, pl.replicated_len_type = l.rep;
-        pl.offset_type = l.off, pl.object_num_type = l.num, pl.payload_len_type = l.plen;
-        s.push_back({"layout", av_file(mux(objs, 700, pl, 1, 650), 700), all_but_last(objs)});
-    }
+    for (const auto& l : layouts)
+        s.push_back({"layout", av_file(mux(objs, 700, {l.ec, l.multiple, l.len, l.seq, l.pad, l.rep, l.off, l.num, l.plen, {}, {}, {}}, 1, 650), 700),
+                     all_but_last(objs)});
     // Packets off their grid: found again by the resync scan, the partial object kept.
     const Bytes v1 = pattern(900, 1), v2 = pattern(100, 2), junk = {0x90, 0x11, 0x22, 0x33, 0x44};
     const Bytes tail = packet({media(2, 2, 0, 100, 40, v2, true),
                                media(2, 3, 0, 10, 80, pattern(10, 3))}, 1024);
-    const auto part = [&](size_t from, size_t to) {
-        return media(2, 1, uint32_t(from), 900, 0, cut(v1, from, to), true);
-    };
+    const auto part = [&](uint32_t from, size_t to) { return media(2, 1, from, 900, 0, cut(v1, from, to), true); };
     s.push_back({"misplaced packet ends an object",
                  av_file({one(part(0, 500), 1024),
                           asfb::misaligned_packet(junk, {part(500, 900)}, 1024), tail}),
@@ -201,9 +192,7 @@ std::vector<Shape> shapes() {
                  {{2, 0, v1}, {2, 40000, v2}}, 0, 1});
     Bytes zeros(1024, 0);
     zeros[0] = 0x91;  // error correction in an unusual form; nothing plausible after it
-    const auto half = [&](uint32_t num, uint32_t ms, const Bytes& x) {
-        return one(media(1, num, 0, 50, ms, cut(x, 0, 50)), 1024);
-    };
+    const auto half = [&](uint32_t num, uint32_t ms, const Bytes& x) { return one(media(1, num, 0, 50, ms, cut(x, 0, 50)), 1024); };
     s.push_back({"packet without a plausible start",
                  av_file({half(1, 0, a), zeros, half(3, 20, b), half(4, 30, a)}),
                  {{1, 0, cut(a, 0, 50)}, {1, 20000, cut(b, 0, 50)}}, 0, 1});
@@ -264,23 +253,18 @@ std::vector<Shape> shapes() {
                  .setup = [](Player& p) { p.refuse_at(0, 1); }, .no_memory = 1});
     // At the end of the data the input may ask for a scan for a new header,
     // which gives up after 3 s; the header found ends delivery all the same.
-    asfb::PacketFile f;
-    f.video = false, f.packet_size = 512;
-    f.packets = mux({{1, 0, pattern(100, 1)}, {1, 40, pattern(100, 2)}}, 512);
-    Bytes joined = asfb::build_packet_file(f);
-    const std::string found = std::to_string(joined.size() + 100);
-    joined.resize(joined.size() + 100, 0x33);
-    const Bytes next = asfb::build_packet_file(f);
-    joined.insert(joined.end(), next.begin(), next.end());
+    const Bytes first = av_file(mux({{1, 0, pattern(100, 1)}, {1, 40, pattern(100, 2)}}, 512), 512, [](auto& f) { f.video = false; });
+    Bytes joined = first;
+    joined.resize(first.size() + 100, 0x33);
+    joined.insert(joined.end(), first.begin(), first.end());
+    const std::string found = std::to_string(first.size() + 100);
     const struct { int detect; int64_t clock_step; const char* log; int logged; } ends[] = {
         {0, 0, "detect discontinuity at", 0}, {1, 0, "detect discontinuity at ", 2},
         {1, 4000000, "asf_detect_discontinuity timed out", 2}};
     for (const auto& e : ends)
         s.push_back({"end of data", joined, {{1, 0, pattern(100, 1)}}, 0, 0, 1,
-                     [e](Player& p) {
-                         p.input().io()->detect_discontinuity = e.detect;
-                         p.host.clock_step_us = e.clock_step;
-                     }, e.log + (e.logged && !e.clock_step ? found : ""), e.logged});
+                     [e](Player& p) { p.input().io()->detect_discontinuity = e.detect, p.host.clock_step_us = e.clock_step; },
+                     e.log + (e.logged && !e.clock_step ? found : ""), e.logged});
     // A stream switched off before the first call, during separate parsing or
     // right after a packet abandoned there: the other gives each object once.
     const auto many = skewed(80, 0, 3000, 900);
