@@ -13,18 +13,12 @@
 namespace delivery {
 namespace {
 
-using asfb::compressed;
-using asfb::media;
-using asfb::mux;
-using asfb::Object;
-using asfb::packet;
-using asfb::pattern;
-using Tweak = std::function<void(asfb::PacketFile&)>;
+using namespace asfb;
 
 Bytes one(const asfb::Payload& p, uint32_t size) { return packet({p}, size); }
 Bytes cut(const Bytes& b, size_t i, size_t j) { return Bytes(b.begin() + i, b.begin() + j); }
 // A file of one audio stream (1) and one video stream (2) around `packets`.
-Bytes av_file(std::vector<Bytes> packets, uint32_t size = 1024, const Tweak& tweak = {}) {
+Bytes av_file(std::vector<Bytes> packets, uint32_t size = 1024, const std::function<void(PacketFile&)>& tweak = {}) {
     asfb::PacketFile f;
     f.packet_size = size, f.packets = std::move(packets);
     if (tweak) tweak(f);
@@ -272,9 +266,8 @@ std::vector<Shape> shapes() {
     broken.insert(broken.begin() + 30, asfb::damaged_packet(asfb::Damage::PaddingTooLong,
                                                             {media(1, 200, 0, 10, 0, a)}, 1024));
     for (auto off : {HOVA_STREAM_AUDIO, HOVA_STREAM_VIDEO}) {
-        std::vector<Want> want = {};
-        for (const Want& w : all_but_last(many))
-            if ((w.stream == 1) == (off == HOVA_STREAM_VIDEO)) want.push_back(w);
+        auto want = all_but_last(many);
+        std::erase_if(want, [&](const Want& w) { return (w.stream == 1) == (off == HOVA_STREAM_AUDIO); });
         for (int at : {0, 3, 40, -1})  // -1: at the abandoned packet
             s.push_back({"track off", av_file(at < 0 ? broken : mux(many, 1024)), want,
                          -(at < 0), 0, off == HOVA_STREAM_AUDIO ? 2 : 1,
