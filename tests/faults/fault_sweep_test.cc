@@ -18,9 +18,7 @@ namespace {
 using namespace delivery;
 using Frames = std::multiset<std::pair<int64_t, uint32_t>>;
 
-bool in(int rc, std::initializer_list<int> ok) {
-    return std::find(ok.begin(), ok.end(), rc) != ok.end();
-}
+bool in(int rc, std::initializer_list<int> ok) { return std::find(ok.begin(), ok.end(), rc) != ok.end(); }
 
 struct Use {
     std::array<uint64_t, 8> uses{};  // of what each kind of fault is armed on, in kKinds' order
@@ -42,9 +40,8 @@ Use session(const Bytes& file, host::Buffering b, const std::function<void(Playe
         hova_audio_info_st audio{};
         hova_video_info_st video{};
         EXPECT_EQ(d.get_info(ctx, HOVA_STREAM_PROG, 0, &prog), HOVA_OK);
-        const std::initializer_list<int> maybe = {HOVA_OK, HOVA_InvalidParam};
-        EXPECT_TRUE(in(d.get_info(ctx, HOVA_STREAM_AUDIO, 0, &audio), maybe));
-        EXPECT_TRUE(in(d.get_info(ctx, HOVA_STREAM_VIDEO, 0, &video), maybe));
+        EXPECT_TRUE(in(d.get_info(ctx, HOVA_STREAM_AUDIO, 0, &audio), {HOVA_OK, HOVA_InvalidParam}));
+        EXPECT_TRUE(in(d.get_info(ctx, HOVA_STREAM_VIDEO, 0, &video), {HOVA_OK, HOVA_InvalidParam}));
         const int64_t duration = prog.duration > 0 ? prog.duration : 4000000;
         auto deliver = [&](int n) {
             for (int i = 0, rc = HOVA_OK; i < n && rc != HOVA_EndOfStream; ++i)
@@ -76,8 +73,7 @@ Bytes built_file() {
         objs.push_back({2, 2040 + 100 * i, asfb::pattern(1300 + 97 * i, 50 + i), i % 4 == 0});
     }
     asfb::PacketFile pf;
-    pf.packet_size = 800, pf.preroll_ms = 2000;
-    pf.packets = asfb::mux(objs, pf.packet_size);
+    pf.packet_size = 800, pf.preroll_ms = 2000, pf.packets = asfb::mux(objs, 800);
     pf.packets.push_back(asfb::packet(
         {asfb::compressed(1, 40, 3700, 20, {asfb::pattern(30, 1), asfb::pattern(40, 2)})}, 800));
     const uint32_t n = uint32_t(pf.packets.size());
@@ -127,9 +123,8 @@ TEST(FaultSweep, EveryFaultAtEveryUseThroughAWholeSession) {
                 for (uint64_t n = 1; n <= total + 1;
                      n = k.stride ? n + (n < 64 ? 1 : k.stride * (thread ? 17 : 1))
                                   : next_cut(n, clean, thread)) {
-                    SCOPED_TRACE(testing::Message() << name << ", " << host::buffering_name(b)
-                                                    << ", " << k.what << " " << n << " of "
-                                                    << total);
+                    SCOPED_TRACE(testing::Message() << name << ", " << host::buffering_name(b) << ", "
+                                                    << k.what << " " << n << " of " << total);
                     const Bytes part(file.begin(), file.begin() + long(cut ? n - 1 : 0));
                     const Use u = session(cut ? part : file, b, [&](Player& p) { k.arm(p, n); });
                     size_t known = 0;
