@@ -98,13 +98,12 @@ struct Shape {
 std::vector<Shape> shapes() {
     std::vector<Shape> s;
     const Bytes obj = pattern(9000, 7);
+    std::vector<Bytes> thirds;
+    for (uint32_t at : {0, 4000, 8000})
+        thirds.push_back(one(media(2, 7, at, 9000, 1200, cut(obj, at, std::min(at + 4000, 9000u)), true), 4200));
+    thirds.push_back(one(media(2, 8, 0, 10, 1300, pattern(10, 1)), 4200));
     s.push_back({"object over three payloads, preroll 200",
-                 av_file({one(media(2, 7, 0, 9000, 1200, cut(obj, 0, 4000), true), 4200),
-                          one(media(2, 7, 4000, 9000, 1200, cut(obj, 4000, 8000), true), 4200),
-                          one(media(2, 7, 8000, 9000, 1200, cut(obj, 8000, 9000), true), 4200),
-                          one(media(2, 8, 0, 10, 1300, pattern(10, 1)), 4200)},
-                         4200, [](auto& f) { f.preroll_ms = 200; }),
-                 {{2, 1000000, obj}}});
+                 av_file(thirds, 4200, [](auto& f) { f.preroll_ms = 200; }), {{2, 1000000, obj}}});
     s.push_back({"middle payload lost",
                  av_file({one(media(2, 7, 0, 9000, 0, pattern(4000, 1)), 4200),
                           one(media(2, 7, 8000, 9000, 0, pattern(1000, 2)), 4200),
@@ -115,13 +114,12 @@ std::vector<Shape> shapes() {
         {1500, 3000, 0, 8, -1500000}, {5000, 3000, 0, 8, 2000000},
         {5000, 3000, 5000000, 12, 2500000}, {0, 0, 0, 5, -1}, {0, 0, 0, 0, -1}};
     for (const auto& t : times) {
-        const Bytes o = pattern(300, 1);
-        const auto first = t.rep >= 8 ? media(1, 1, 0, 300, t.ms, o, false, t.rep - 8)
-                                      : asfb::untimed(1, 1, 0, o, t.rep);
+        const auto first = t.rep >= 8 ? media(1, 1, 0, 300, t.ms, pattern(300, 1), false, t.rep - 8)
+                                      : asfb::untimed(1, 1, 0, pattern(300, 1), t.rep);
         s.push_back({"time " + std::to_string(t.want),
                      av_file({packet({first, media(1, 2, 0, 10, t.ms + 50, pattern(10, 2))}, 1024)},
                              1024, [&](auto& f) { f.preroll_ms = t.preroll, f.audio_time_offset = t.offset; }),
-                     {{1, t.want, o}}});
+                     {{1, t.want, pattern(300, 1)}}});
     }
     s.push_back({"video joined in an object's middle",
                  av_file({packet({media(2, 4, 100, 300, 0, pattern(200, 4)),
@@ -130,11 +128,9 @@ std::vector<Shape> shapes() {
                                   media(2, 6, 0, 20, 80, pattern(20, 6))}, 1024)}),
                  {{2, 40000, pattern(200, 5)}}});
     s.push_back({"other streams skipped",
-                 av_file({packet({media(5, 1, 0, 100, 0, pattern(100, 1)),
-                                  media(1, 1, 0, 10, 0, pattern(10, 3)),
+                 av_file({packet({media(5, 1, 0, 100, 0, pattern(100, 1)), media(1, 1, 0, 10, 0, pattern(10, 3)),
                                   media(5, 3, 0, 100, 0, pattern(100, 2))}, 1024),
-                          one(media(5, 4, 0, 100, 0, pattern(100, 4)), 1024)}),
-                 {}});
+                          one(media(5, 4, 0, 100, 0, pattern(100, 4)), 1024)})});
     const Bytes a = pattern(100, 1), b = pattern(120, 2), c = pattern(80, 3), h = pattern(60, 4);
     Bytes habc = h;
     for (const Bytes* p : {&a, &b, &c}) habc.insert(habc.end(), p->begin(), p->end());
@@ -168,12 +164,11 @@ std::vector<Shape> shapes() {
         {true, true, 3, 2, 1, 2, 2, 3, 2},  {true, false, 0, 3, 2, 1, 3, 1, 2},
         {false, false, 2, 0, 0, 1, 3, 2, 2}};
     for (const auto& l : layouts)
-        s.push_back({"layout", av_file(mux(objs, 700, {l.ec, l.multiple, l.len, l.seq, l.pad, l.rep, l.off, l.num, l.plen, {}, {}, {}}, 1, 650), 700),
-                     all_but_last(objs)});
+        s.push_back({"layout", av_file(mux(objs, 700, {l.ec, l.multiple, l.len, l.seq, l.pad, l.rep, l.off,
+                                                       l.num, l.plen, {}, {}, {}}, 1, 650), 700), all_but_last(objs)});
     // Packets off their grid: found again by the resync scan, the partial object kept.
     const Bytes v1 = pattern(900, 1), v2 = pattern(100, 2), junk = {0x90, 0x11, 0x22, 0x33, 0x44};
-    const Bytes tail = packet({media(2, 2, 0, 100, 40, v2, true),
-                               media(2, 3, 0, 10, 80, pattern(10, 3))}, 1024);
+    const Bytes tail = packet({media(2, 2, 0, 100, 40, v2, true), media(2, 3, 0, 10, 80, pattern(10, 3))}, 1024);
     const auto part = [&](uint32_t from, size_t to) { return media(2, 1, from, 900, 0, cut(v1, from, to), true); };
     s.push_back({"misplaced packet ends an object",
                  av_file({one(part(0, 500), 1024),
@@ -181,8 +176,7 @@ std::vector<Shape> shapes() {
                  {{2, 0, v1}, {2, 40000, v2}}});
     s.push_back({"misplaced packet holds an object",
                  av_file({one(media(1, 1, 0, 10, 0, pattern(10, 9)), 1024),
-                          asfb::misaligned_packet(junk, {part(0, 450), part(450, 900)}, 1024),
-                          tail}),
+                          asfb::misaligned_packet(junk, {part(0, 450), part(450, 900)}, 1024), tail}),
                  {{2, 0, v1}, {2, 40000, v2}}, 0, 1});
     Bytes zeros(1024, 0);
     zeros[0] = 0x91;  // error correction in an unusual form; nothing plausible after it
