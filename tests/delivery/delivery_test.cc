@@ -55,8 +55,7 @@ std::vector<Want> all_but_last(const std::vector<Object>& objs) {
 void expect_frames(const Player& pl, const std::vector<Want>& want) {
     for (uint8_t s : {1, 2}) {
         std::vector<std::tuple<int64_t, int, uint32_t>> got, wanted;
-        for (const auto& e : pl.frames(s == 1 ? HOVA_STREAM_AUDIO : HOVA_STREAM_VIDEO))
-            got.emplace_back(e.pts, e.size, e.crc32);
+        for (const auto& e : pl.frames(s == 1 ? HOVA_STREAM_AUDIO : HOVA_STREAM_VIDEO)) got.emplace_back(e.pts, e.size, e.crc32);
         for (const Want& w : want)
             if (w.stream == s) wanted.emplace_back(w.pts, int(w.data.size()), crc(w.data));
         EXPECT_EQ(got, wanted) << "stream " << int(s);
@@ -191,19 +190,16 @@ std::vector<Shape> shapes() {
         {30, 9960, 12001, 1}, {30, 9960, 7500, 1}};
     for (const auto& k : skews) {
         const auto o = skewed(k.n, k.a, k.v);
-        s.push_back({"skew", av_file(mux(o, 1024)), all_but_last(o), 0, 0, 3, {},
-                     "bad interleaved ASF detected, switch to index base, v " +
-                         std::to_string(k.v * 1000) + ", a " + std::to_string((k.a + 40) * 1000),
-                     k.switches});
+        s.push_back({"skew", av_file(mux(o, 1024)), all_but_last(o), 0, 0, 3, {}, "bad interleaved ASF detected, switch to index base, v " +
+                     std::to_string(k.v * 1000) + ", a " + std::to_string((k.a + 40) * 1000), k.switches});
     }
     // Uncounted packets: from the data object's size, else the input's size.
     const auto inter = skewed(30, 0, 40), apart = skewed(30, 0, 3000);
     const struct { const std::vector<Object>* o; std::optional<uint64_t> size; bool bc; } unc[] = {
         {&inter, {}, true}, {&inter, 50, true}, {&apart, 50, true}, {&inter, 50, false}};
     for (const auto& u : unc)
-        s.push_back({"uncounted", av_file(mux(*u.o, 1024), 1024, [&](asfb::PacketFile& f) {
-                         f.packet_count = 0, f.broadcast = u.bc, f.data_object_size = u.size;
-                     }), all_but_last(*u.o)});
+        s.push_back({"uncounted", av_file(mux(*u.o, 1024), 1024, [&](auto& f) { f.packet_count = 0, f.broadcast = u.bc, f.data_object_size = u.size; }),
+                     all_but_last(*u.o)});
     s.push_back({"no packets", av_file({}, 1024, [](auto& f) { f.packet_count = 0; }), {}});
     // Spread audio written back column by column; as received when the size
     // does not match or the host refuses the memory.
@@ -215,12 +211,11 @@ std::vector<Shape> shapes() {
         {3, 4, 2, pattern(12, 3), pattern(12, 3), "realloc for audio spread fails"},
         {5, 1000, 100, asfb::spread_scramble(pattern(5000, 4), 5, 1000, 100), pattern(5000, 4), ""}};
     for (const auto& r : spread) {
-        const bool refuse = r.log[0] == 'r';
         const auto audio = [&](auto& f) { f.video = false, f.spread = {r.span, r.plen, r.clen}; };
         s.push_back({"spread", av_file({packet({media(1, 1, 0, uint32_t(r.got.size()), 100, r.got),
                                                 media(1, 2, 0, 4, 200, a)}, 6000)}, 6000, audio),
                      {{1, 100000, r.want}}, 0, 0, 1,
-                     [refuse](Player& p) { p.host.refuse_stream_realloc = refuse; }, r.log});
+                     [refuse = r.log[0] == 'r'](Player& p) { p.host.refuse_stream_realloc = refuse; }, r.log});
     }
     // Thumbnails: key frames spaced by the interval; -1 turns the rule off.
     std::vector<Object> th;
@@ -231,13 +226,11 @@ std::vector<Shape> shapes() {
         for (const auto& o : th)
             if (o.pts_ms < 13000 && (interval < 0 || o.pts_ms % 5000 == 0 || o.pts_ms == 12000))
                 w.push_back({2, o.pts_ms * 1000, o.data});
-        s.push_back({"thumbnails", av_file(mux(th, 1024), 1024, [](auto& f) { f.audio = false; }), w, 0,
-                     interval < 0 ? 0u : 5u, 2,
+        s.push_back({"thumbnails", av_file(mux(th, 1024), 1024, [](auto& f) { f.audio = false; }), w, 0, interval < 0 ? 0u : 5u, 2,
                      [interval](Player& p) { hova_asff_demuxer.set_multi_thumb(p.ctx(), interval); }});
     }
     // A refused configuration is sent again on the next call.
-    s.push_back({.what = "configuration refused",
-                 .file = av_file({one(media(1, 1, 0, 10, 0, pattern(10, 1)), 1024)}),
+    s.push_back({.what = "configuration refused", .file = av_file({one(media(1, 1, 0, 10, 0, pattern(10, 1)), 1024)}),
                  .setup = [](Player& p) { p.refuse_at(0, 1); }, .no_memory = 1});
     // At the end of the data the input may ask for a scan for a new header,
     // which gives up after 3 s; the header found ends delivery all the same.
