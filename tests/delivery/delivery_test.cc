@@ -3,6 +3,7 @@
 // and the log lines it must, whatever the host does in between (refuse
 // memory, switch a stream off, ask for a new header at the end of the data).
 #include <functional>
+#include <tuple>
 
 #include "asf_internal.h"
 #include "asf_modes.h"
@@ -12,25 +13,53 @@
 namespace delivery {
 namespace {
 
-using asfb::compressed;
-using asfb::media;
-using asfb::Object;
-using asfb::packet;
-using asfb::pattern;
-using Tweak = std::function<void(asfb::PacketFile&)>;
+using namespace asfb;
 
 Bytes one(const asfb::Payload& p, uint32_t size) { return packet({p}, size); }
 Bytes cut(const Bytes& b, size_t i, size_t j) { return Bytes(b.begin() + i, b.begin() + j); }
-Bytes pfile(std::vector<Bytes> packets, uint32_t size, const Tweak& tweak) {
+// A file of one audio stream (1) and one video stream (2) around `packets`.
+Bytes av_file(std::vector<Bytes> packets, uint32_t size = 1024, const std::function<void(PacketFile&)>& tweak = {}) {
     asfb::PacketFile f;
     f.packet_size = size, f.packets = std::move(packets);
-    tweak(f);
+    if (tweak) tweak(f);
     return asfb::build_packet_file(f);
 }
 Bytes chunks(std::initializer_list<int> order) {
     Bytes out;
     for (int c : order) out.insert(out.end(), {uint8_t(c * 16), uint8_t(c * 16 + 1)});
     return out;
+}
+// Audio (stream 1) at a + 40k ms, video (2) at v + 40k ms, alternating in the file.
+std::vector<Object> skewed(uint32_t n, uint32_t a, uint32_t v, uint32_t vsize = 700) {
+    std::vector<Object> objs;
+    for (uint32_t k = 0; k < n; ++k) {
+        objs.push_back({1, a + 40 * k, pattern(150 + k % 13, k)});
+        objs.push_back({2, v + 40 * k, pattern(vsize + 37 * (k % 7), 1000 + k), k % 10 == 0});
+    }
+    return objs;
+}
+// A frame the host must receive: stream 1 audio, 2 video; time in microseconds.
+struct Want { uint8_t stream; int64_t pts; Bytes data; };
+// Each stream's objects but its last (which stays pending at the end).
+std::vector<Want> all_but_last(const std::vector<Object>& objs) {
+    std::vector<Want> out;
+    for (uint8_t s : {1, 2}) {
+        const size_t at = out.size();
+        for (const auto& o : objs)
+            if (o.stream == s) out.push_back({s, int64_t(o.pts_ms) * 1000, o.data});
+        if (out.size() > at) out.pop_back();
+    }
+    return out;
+}
+// The frames of each stream are exactly `want`'s, in order.
+void expect_frames(const Player& pl, const std::vector<Want>& want) {
+    for (uint8_t s : {1, 2}) {
+        std::vector<std::tuple<int64_t, int, uint32_t>> got, wanted;
+        for (const auto& e : pl.frames(s == 1 ? HOVA_STREAM_AUDIO : HOVA_STREAM_VIDEO)) got.emplace_back(e.pts, e.size, e.crc32);
+        for (const Want& w : want)
+            if (w.stream == s) wanted.emplace_back(w.pts, int(w.data.size()), crc(w.data));
+        EXPECT_EQ(got, wanted) << "stream " << int(s);
+    }
 }
 
 // Switches `off` off after `at` calls (-1: at the first packet abandoned),
@@ -45,12 +74,9 @@ void switch_off(Player& p, hova_stream_type_et off, int at) {
     for (const auto& c : calls)
         EXPECT_EQ(hova_asff_demuxer.set_track(p.ctx(), c.type, c.index, 1, HOVA_INPUT_MASTER),
                   c.result) << c.type << " " << c.index;
-    const int* active = p.ctx()->s.active_stream;
-    EXPECT_EQ(active[AUD] < 0, off == HOVA_STREAM_AUDIO);
-    EXPECT_EQ(active[VID] < 0, off == HOVA_STREAM_VIDEO);
-    auto& ev = p.host.events();
-    ev.erase(std::remove_if(ev.begin(), ev.end(), [&](auto& e) { return e.type == off; }),
-             ev.end());
+    EXPECT_EQ(p.ctx()->s.active_stream[AUD] < 0, off == HOVA_STREAM_AUDIO);
+    EXPECT_EQ(p.ctx()->s.active_stream[VID] < 0, off == HOVA_STREAM_VIDEO);
+    std::erase_if(p.host.events(), [&](auto& e) { return e.type == off; });
     EXPECT_EQ(p.ctx()->parse_mode, PARSE_SEQ);
     EXPECT_EQ(p.ctx()->accept_stream_type, HOVA_STREAM_NONE);
 }
@@ -71,12 +97,12 @@ struct Shape {
 std::vector<Shape> shapes() {
     std::vector<Shape> s;
     const Bytes obj = pattern(9000, 7);
+    std::vector<Bytes> thirds;
+    for (uint32_t at : {0, 4000, 8000})
+        thirds.push_back(one(media(2, 7, at, 9000, 1200, cut(obj, at, std::min(at + 4000, 9000u)), true), 4200));
+    thirds.push_back(one(media(2, 8, 0, 10, 1300, pattern(10, 1)), 4200));
     s.push_back({"object over three payloads, preroll 200",
-                 av_file({one(media(2, 7, 0, 9000, 1200, cut(obj, 0, 4000), true), 4200),
-                          one(media(2, 7, 4000, 9000, 1200, cut(obj, 4000, 8000), true), 4200),
-                          one(media(2, 7, 8000, 9000, 1200, cut(obj, 8000, 9000), true), 4200),
-                          one(media(2, 8, 0, 10, 1300, pattern(10, 1)), 4200)}, 4200, 200),
-                 {{2, 1000000, obj}}});
+                 av_file(thirds, 4200, [](auto& f) { f.preroll_ms = 200; }), {{2, 1000000, obj}}});
     s.push_back({"middle payload lost",
                  av_file({one(media(2, 7, 0, 9000, 0, pattern(4000, 1)), 4200),
                           one(media(2, 7, 8000, 9000, 0, pattern(1000, 2)), 4200),
@@ -87,29 +113,23 @@ std::vector<Shape> shapes() {
         {1500, 3000, 0, 8, -1500000}, {5000, 3000, 0, 8, 2000000},
         {5000, 3000, 5000000, 12, 2500000}, {0, 0, 0, 5, -1}, {0, 0, 0, 0, -1}};
     for (const auto& t : times) {
-        const Bytes o = pattern(300, 1);
-        const auto first = t.rep >= 8 ? media(1, 1, 0, 300, t.ms, o, false, t.rep - 8)
-                                      : asfb::untimed(1, 1, 0, o, t.rep);
+        const auto first = t.rep >= 8 ? media(1, 1, 0, 300, t.ms, pattern(300, 1), false, t.rep - 8)
+                                      : asfb::untimed(1, 1, 0, pattern(300, 1), t.rep);
         s.push_back({"time " + std::to_string(t.want),
-                     pfile({packet({first, media(1, 2, 0, 10, t.ms + 50, pattern(10, 2))}, 1024)},
-                           1024, [&](asfb::PacketFile& f) {
-                               f.preroll_ms = t.preroll, f.audio_time_offset = t.offset;
-                           }),
-                     {{1, t.want, o}}});
+                     av_file({packet({first, media(1, 2, 0, 10, t.ms + 50, pattern(10, 2))}, 1024)},
+                             1024, [&](auto& f) { f.preroll_ms = t.preroll, f.audio_time_offset = t.offset; }),
+                     {{1, t.want, pattern(300, 1)}}});
     }
-    const Bytes v5 = pattern(200, 5);
     s.push_back({"video joined in an object's middle",
                  av_file({packet({media(2, 4, 100, 300, 0, pattern(200, 4)),
                                   media(1, 1, 0, 50, 0, pattern(50, 1))}, 1024),
-                          packet({media(2, 5, 0, 200, 40, v5, true),
+                          packet({media(2, 5, 0, 200, 40, pattern(200, 5), true),
                                   media(2, 6, 0, 20, 80, pattern(20, 6))}, 1024)}),
-                 {{2, 40000, v5}}});
+                 {{2, 40000, pattern(200, 5)}}});
     s.push_back({"other streams skipped",
-                 av_file({packet({media(5, 1, 0, 100, 0, pattern(100, 1)),
-                                  media(1, 1, 0, 10, 0, pattern(10, 3)),
+                 av_file({packet({media(5, 1, 0, 100, 0, pattern(100, 1)), media(1, 1, 0, 10, 0, pattern(10, 3)),
                                   media(5, 3, 0, 100, 0, pattern(100, 2))}, 1024),
-                          one(media(5, 4, 0, 100, 0, pattern(100, 4)), 1024)}),
-                 {}});
+                          one(media(5, 4, 0, 100, 0, pattern(100, 4)), 1024)})});
     const Bytes a = pattern(100, 1), b = pattern(120, 2), c = pattern(80, 3), h = pattern(60, 4);
     Bytes habc = h;
     for (const Bytes* p : {&a, &b, &c}) habc.insert(habc.end(), p->begin(), p->end());
@@ -124,16 +144,13 @@ std::vector<Shape> shapes() {
                                   compressed(1, 1, 0, 20, {a}), compressed(1, 2, 20, 20, {b}),
                                   compressed(1, 3, 40, 20, {a})}, 1024)}),
                  {{1, 0, a}, {1, 20000, b}}});
+    const auto six = [](uint32_t i) { return media(1, i + 1, 0, 100, i * 10, pattern(100, i)); };
     for (auto how : {asfb::Damage::PacketLenTooLong, asfb::Damage::PaddingTooLong,
                      asfb::Damage::NoPayloads, asfb::Damage::PayloadTooLong}) {
         std::vector<Bytes> packets;
-        std::vector<Want> want = {};
-        for (uint32_t i = 0; i < 6; ++i) {
-            const auto p = media(1, i + 1, 0, 100, i * 10, pattern(100, i));
-            packets.push_back(i == 2 ? asfb::damaged_packet(how, {p}, 512) : one(p, 512));
-            if (i != 2 && i != 5) want.push_back({1, i * 10000, p.data});
-        }
-        s.push_back({"damaged packet " + std::to_string(int(how)), av_file(packets, 512), want, 1});
+        for (uint32_t i = 0; i < 6; ++i) packets.push_back(i == 2 ? asfb::damaged_packet(how, {six(i)}, 512) : one(six(i), 512));
+        s.push_back({"damaged packet " + std::to_string(int(how)), av_file(packets, 512),
+                     {{1, 0, six(0).data}, {1, 10000, six(1).data}, {1, 30000, six(3).data}, {1, 40000, six(4).data}}, 1});
     }
     // Packet and payload header layouts; packets keep padding so a misplaced end shows.
     std::vector<Object> objs;
@@ -145,34 +162,24 @@ std::vector<Shape> shapes() {
         {true, true, 0, 0, 2, 1, 3, 1, 2},  {false, true, 0, 1, 2, 1, 3, 1, 3},
         {true, true, 3, 2, 1, 2, 2, 3, 2},  {true, false, 0, 3, 2, 1, 3, 1, 2},
         {false, false, 2, 0, 0, 1, 3, 2, 2}};
-    for (const auto& l : layouts) {
-        asfb::PacketLayout pl;
-        pl.error_correction = l.ec, pl.multiple = l.multiple, pl.packet_len_type = l.len;
-        pl.sequence_type = l.seq, pl.padding_len_type = l.pad, pl.replicated_len_type = l.rep;
-        pl.offset_type = l.off, pl.object_num_type = l.num, pl.payload_len_type = l.plen;
-        s.push_back({"layout", av_file(asfb::mux(objs, 700, pl, 1, 650), 700), all_but_last(objs)});
-    }
+    for (const auto& l : layouts)
+        s.push_back({"layout", av_file(mux(objs, 700, {l.ec, l.multiple, l.len, l.seq, l.pad, l.rep, l.off,
+                                                       l.num, l.plen, {}, {}, {}}, 1, 650), 700), all_but_last(objs)});
     // Packets off their grid: found again by the resync scan, the partial object kept.
     const Bytes v1 = pattern(900, 1), v2 = pattern(100, 2), junk = {0x90, 0x11, 0x22, 0x33, 0x44};
-    const Bytes tail = packet({media(2, 2, 0, 100, 40, v2, true),
-                               media(2, 3, 0, 10, 80, pattern(10, 3))}, 1024);
-    const auto part = [&](size_t from, size_t to) {
-        return media(2, 1, uint32_t(from), 900, 0, cut(v1, from, to), true);
-    };
+    const Bytes tail = packet({media(2, 2, 0, 100, 40, v2, true), media(2, 3, 0, 10, 80, pattern(10, 3))}, 1024);
+    const auto part = [&](uint32_t from, size_t to) { return media(2, 1, from, 900, 0, cut(v1, from, to), true); };
     s.push_back({"misplaced packet ends an object",
                  av_file({one(part(0, 500), 1024),
                           asfb::misaligned_packet(junk, {part(500, 900)}, 1024), tail}),
                  {{2, 0, v1}, {2, 40000, v2}}});
     s.push_back({"misplaced packet holds an object",
                  av_file({one(media(1, 1, 0, 10, 0, pattern(10, 9)), 1024),
-                          asfb::misaligned_packet(junk, {part(0, 450), part(450, 900)}, 1024),
-                          tail}),
+                          asfb::misaligned_packet(junk, {part(0, 450), part(450, 900)}, 1024), tail}),
                  {{2, 0, v1}, {2, 40000, v2}}, 0, 1});
     Bytes zeros(1024, 0);
     zeros[0] = 0x91;  // error correction in an unusual form; nothing plausible after it
-    const auto half = [&](uint32_t num, uint32_t ms, const Bytes& x) {
-        return one(media(1, num, 0, 50, ms, cut(x, 0, 50)), 1024);
-    };
+    const auto half = [&](uint32_t num, uint32_t ms, const Bytes& x) { return one(media(1, num, 0, 50, ms, cut(x, 0, 50)), 1024); };
     s.push_back({"packet without a plausible start",
                  av_file({half(1, 0, a), zeros, half(3, 20, b), half(4, 30, a)}),
                  {{1, 0, cut(a, 0, 50)}, {1, 20000, cut(b, 0, 50)}}, 0, 1});
@@ -183,41 +190,32 @@ std::vector<Shape> shapes() {
         {30, 9960, 12001, 1}, {30, 9960, 7500, 1}};
     for (const auto& k : skews) {
         const auto o = skewed(k.n, k.a, k.v);
-        s.push_back({"skew", av_file(asfb::mux(o, 1024)), all_but_last(o), 0, 0, 3, {},
-                     "bad interleaved ASF detected, switch to index base, v " +
-                         std::to_string(k.v * 1000) + ", a " + std::to_string((k.a + 40) * 1000),
-                     k.switches});
+        s.push_back({"skew", av_file(mux(o, 1024)), all_but_last(o), 0, 0, 3, {}, "bad interleaved ASF detected, switch to index base, v " +
+                     std::to_string(k.v * 1000) + ", a " + std::to_string((k.a + 40) * 1000), k.switches});
     }
     // Uncounted packets: from the data object's size, else the input's size.
     const auto inter = skewed(30, 0, 40), apart = skewed(30, 0, 3000);
     const struct { const std::vector<Object>* o; std::optional<uint64_t> size; bool bc; } unc[] = {
         {&inter, {}, true}, {&inter, 50, true}, {&apart, 50, true}, {&inter, 50, false}};
     for (const auto& u : unc)
-        s.push_back({"uncounted", pfile(asfb::mux(*u.o, 1024), 1024, [&](asfb::PacketFile& f) {
-                         f.packet_count = 0, f.broadcast = u.bc, f.data_object_size = u.size;
-                     }), all_but_last(*u.o)});
-    s.push_back({"no packets", pfile({}, 1024, [](auto& f) { f.packet_count = 0; }), {}});
+        s.push_back({"uncounted", av_file(mux(*u.o, 1024), 1024, [&](auto& f) { f.packet_count = 0, f.broadcast = u.bc, f.data_object_size = u.size; }),
+                     all_but_last(*u.o)});
+    s.push_back({"no packets", av_file({}, 1024, [](auto& f) { f.packet_count = 0; }), {}});
     // Spread audio written back column by column; as received when the size
     // does not match or the host refuses the memory.
-    const struct { uint8_t span; uint16_t plen, clen; Bytes got, want; const char* log; } spread[] =
-    {
+    const struct { uint8_t span; uint16_t plen, clen; Bytes got, want; const char* log; } spread[] = {
         {2, 4, 2, chunks({0, 1, 2, 3}), chunks({0, 2, 1, 3}), ""},
         {3, 4, 2, chunks({0, 1, 2, 3, 4, 5}), chunks({0, 3, 1, 4, 2, 5}), ""},
         {1, 4, 2, chunks({0, 1, 2, 3}), chunks({0, 1, 2, 3}), ""},
         {3, 4, 2, pattern(11, 3), pattern(11, 3), "object size 11 does not match spread len 3 x 4"},
         {3, 4, 2, pattern(12, 3), pattern(12, 3), "realloc for audio spread fails"},
-        {5, 1000, 100, asfb::spread_scramble(pattern(5000, 4), 5, 1000, 100), pattern(5000, 4),
-         ""}};
+        {5, 1000, 100, asfb::spread_scramble(pattern(5000, 4), 5, 1000, 100), pattern(5000, 4), ""}};
     for (const auto& r : spread) {
-        const uint32_t n = uint32_t(r.got.size());
-        const bool refuse = r.log[0] == 'r';
-        s.push_back({"spread", pfile({packet({media(1, 1, 0, n, 100, r.got),
-                                              media(1, 2, 0, 4, 200, a)}, 6000)}, 6000,
-                                     [&](asfb::PacketFile& f) {
-                                         f.video = false, f.spread = {r.span, r.plen, r.clen};
-                                     }),
+        const auto audio = [&](auto& f) { f.video = false, f.spread = {r.span, r.plen, r.clen}; };
+        s.push_back({"spread", av_file({packet({media(1, 1, 0, uint32_t(r.got.size()), 100, r.got),
+                                                media(1, 2, 0, 4, 200, a)}, 6000)}, 6000, audio),
                      {{1, 100000, r.want}}, 0, 0, 1,
-                     [refuse](Player& p) { p.host.refuse_stream_realloc = refuse; }, r.log});
+                     [refuse = r.log[0] == 'r'](Player& p) { p.host.refuse_stream_realloc = refuse; }, r.log});
     }
     // Thumbnails: key frames spaced by the interval; -1 turns the rule off.
     std::vector<Object> th;
@@ -228,47 +226,37 @@ std::vector<Shape> shapes() {
         for (const auto& o : th)
             if (o.pts_ms < 13000 && (interval < 0 || o.pts_ms % 5000 == 0 || o.pts_ms == 12000))
                 w.push_back({2, o.pts_ms * 1000, o.data});
-        s.push_back({"thumbnails",
-                     pfile(asfb::mux(th, 1024), 1024, [](auto& f) { f.audio = false; }), w, 0,
-                     interval < 0 ? 0u : 5u, 2, [interval](Player& p) {
-                         hova_asff_demuxer.set_multi_thumb(p.ctx(), interval);
-                     }});
+        s.push_back({"thumbnails", av_file(mux(th, 1024), 1024, [](auto& f) { f.audio = false; }), w, 0, interval < 0 ? 0u : 5u, 2,
+                     [interval](Player& p) { hova_asff_demuxer.set_multi_thumb(p.ctx(), interval); }});
     }
     // A refused configuration is sent again on the next call.
-    s.push_back({.what = "configuration refused",
-                 .file = av_file({one(media(1, 1, 0, 10, 0, pattern(10, 1)), 1024)}),
-                 .setup = [](Player& p) { p.refuse_alloc_at(1); }, .no_memory = 1});
+    s.push_back({.what = "configuration refused", .file = av_file({one(media(1, 1, 0, 10, 0, pattern(10, 1)), 1024)}),
+                 .setup = [](Player& p) { p.refuse_at(0, 1); }, .no_memory = 1});
     // At the end of the data the input may ask for a scan for a new header,
     // which gives up after 3 s; the header found ends delivery all the same.
-    asfb::PacketFile f;
-    f.video = false, f.packet_size = 512;
-    f.packets = asfb::mux({{1, 0, pattern(100, 1)}, {1, 40, pattern(100, 2)}}, 512);
-    Bytes joined = asfb::build_packet_file(f);
-    const std::string found = std::to_string(joined.size() + 100);
-    joined.resize(joined.size() + 100, 0x33);
-    const Bytes next = asfb::build_packet_file(f);
-    joined.insert(joined.end(), next.begin(), next.end());
+    const Bytes first = av_file(mux({{1, 0, pattern(100, 1)}, {1, 40, pattern(100, 2)}}, 512), 512, [](auto& f) { f.video = false; });
+    Bytes joined = first;
+    joined.resize(first.size() + 100, 0x33);
+    joined.insert(joined.end(), first.begin(), first.end());
+    const std::string found = std::to_string(first.size() + 100);
     const struct { int detect; int64_t clock_step; const char* log; int logged; } ends[] = {
         {0, 0, "detect discontinuity at", 0}, {1, 0, "detect discontinuity at ", 2},
         {1, 4000000, "asf_detect_discontinuity timed out", 2}};
     for (const auto& e : ends)
         s.push_back({"end of data", joined, {{1, 0, pattern(100, 1)}}, 0, 0, 1,
-                     [e](Player& p) {
-                         p.input().io()->detect_discontinuity = e.detect;
-                         p.host.clock_step_us = e.clock_step;
-                     }, e.log + (e.logged && !e.clock_step ? found : ""), e.logged});
+                     [e](Player& p) { p.input().io()->detect_discontinuity = e.detect, p.host.clock_step_us = e.clock_step; },
+                     e.log + (e.logged && !e.clock_step ? found : ""), e.logged});
     // A stream switched off before the first call, during separate parsing or
     // right after a packet abandoned there: the other gives each object once.
     const auto many = skewed(80, 0, 3000, 900);
-    std::vector<Bytes> broken = asfb::mux(many, 1024);
+    std::vector<Bytes> broken = mux(many, 1024);
     broken.insert(broken.begin() + 30, asfb::damaged_packet(asfb::Damage::PaddingTooLong,
                                                             {media(1, 200, 0, 10, 0, a)}, 1024));
     for (auto off : {HOVA_STREAM_AUDIO, HOVA_STREAM_VIDEO}) {
-        std::vector<Want> want = {};
-        for (const Want& w : all_but_last(many))
-            if ((w.stream == 1) == (off == HOVA_STREAM_VIDEO)) want.push_back(w);
+        auto want = all_but_last(many);
+        std::erase_if(want, [&](const Want& w) { return (w.stream == 1) == (off == HOVA_STREAM_AUDIO); });
         for (int at : {0, 3, 40, -1})  // -1: at the abandoned packet
-            s.push_back({"track off", av_file(at < 0 ? broken : asfb::mux(many, 1024)), want,
+            s.push_back({"track off", av_file(at < 0 ? broken : mux(many, 1024)), want,
                          -(at < 0), 0, off == HOVA_STREAM_AUDIO ? 2 : 1,
                          [off, at](Player& p) { switch_off(p, off, at); }});
     }
@@ -298,16 +286,12 @@ TEST(Delivery, EveryShapeGivesItsFramesInEveryBufferingMode) {
             EXPECT_EQ(pl.configs(HOVA_STREAM_AUDIO).size(), size_t(sh.streams & 1));
             EXPECT_EQ(pl.configs(HOVA_STREAM_VIDEO).size(), size_t(sh.streams >> 1));
             expect_frames(pl, sh.want);
-            if (sh.try_again >= 0) {
-                EXPECT_EQ(pl.count(HOVA_TryAgain), size_t(sh.try_again));
-            }
+            EXPECT_TRUE(sh.try_again < 0 || pl.count(HOVA_TryAgain) == size_t(sh.try_again));
             EXPECT_EQ(pl.of_kind(EventKind::Discard), sh.discards);
             EXPECT_EQ(pl.of_kind(EventKind::Notify), size_t((sh.streams & 1) + (sh.streams >> 1)));
             EXPECT_EQ(ev.back().kind, EventKind::Notify);
-            if (!sh.log.empty()) {
-                EXPECT_EQ(log.contains(sh.log),
-                          sh.logged == 2 || (sh.logged == 1 && !modes[m].streaming));
-            }
+            EXPECT_TRUE(sh.log.empty() || log.contains(sh.log) ==
+                                              (sh.logged == 2 || (sh.logged == 1 && !modes[m].streaming)));
             pl.expect_clean_close();
         }
     }

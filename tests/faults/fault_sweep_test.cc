@@ -6,6 +6,7 @@
 // frame callbacks are used by the rules and the host holds nothing after
 // close; a refused frame buffer costs one frame at most, and memory faults
 // never bring a frame the clean session did not have.
+#include <array>
 #include <functional>
 #include <set>
 
@@ -17,12 +18,11 @@ namespace {
 using namespace delivery;
 using Frames = std::multiset<std::pair<int64_t, uint32_t>>;
 
-bool in(int rc, std::initializer_list<int> ok) {
-    return std::find(ok.begin(), ok.end(), rc) != ok.end();
-}
+bool in(int rc, std::initializer_list<int> ok) { return std::find(ok.begin(), ok.end(), rc) != ok.end(); }
 
 struct Use {
-    uint64_t mallocs = 0, allocs = 0, reallocs = 0, seeks = 0, reads = 0, header = 0, size = 0;
+    std::array<uint64_t, 8> uses{};  // of what each kind of fault is armed on, in kKinds' order
+    uint64_t header = 0;
     Frames frames;
 };
 
@@ -40,9 +40,8 @@ Use session(const Bytes& file, host::Buffering b, const std::function<void(Playe
         hova_audio_info_st audio{};
         hova_video_info_st video{};
         EXPECT_EQ(d.get_info(ctx, HOVA_STREAM_PROG, 0, &prog), HOVA_OK);
-        const std::initializer_list<int> maybe = {HOVA_OK, HOVA_InvalidParam};
-        EXPECT_TRUE(in(d.get_info(ctx, HOVA_STREAM_AUDIO, 0, &audio), maybe));
-        EXPECT_TRUE(in(d.get_info(ctx, HOVA_STREAM_VIDEO, 0, &video), maybe));
+        EXPECT_TRUE(in(d.get_info(ctx, HOVA_STREAM_AUDIO, 0, &audio), {HOVA_OK, HOVA_InvalidParam}));
+        EXPECT_TRUE(in(d.get_info(ctx, HOVA_STREAM_VIDEO, 0, &video), {HOVA_OK, HOVA_InvalidParam}));
         const int64_t duration = prog.duration > 0 ? prog.duration : 4000000;
         auto deliver = [&](int n) {
             for (int i = 0, rc = HOVA_OK; i < n && rc != HOVA_EndOfStream; ++i)
@@ -60,9 +59,8 @@ Use session(const Bytes& file, host::Buffering b, const std::function<void(Playe
     p.expect_clean_close();
     for (auto t : {HOVA_STREAM_AUDIO, HOVA_STREAM_VIDEO})
         for (const auto& e : p.frames(t)) u.frames.insert({e.pts, e.crc32});
-    u.mallocs = p.host.malloc_calls(), u.allocs = p.alloc_calls, u.reallocs = p.realloc_calls;
-    u.seeks = p.input().counters().seeks, u.reads = p.input().counters().reads;
-    u.size = file.size();
+    u.uses = {p.host.malloc_calls(), p.calls[0], p.calls[1], p.input().counters().seeks,
+              p.input().counters().reads, 17, file.size(), file.size()};
     return u;
 }
 
@@ -75,8 +73,7 @@ Bytes built_file() {
         objs.push_back({2, 2040 + 100 * i, asfb::pattern(1300 + 97 * i, 50 + i), i % 4 == 0});
     }
     asfb::PacketFile pf;
-    pf.packet_size = 800, pf.preroll_ms = 2000;
-    pf.packets = asfb::mux(objs, pf.packet_size);
+    pf.packet_size = 800, pf.preroll_ms = 2000, pf.packets = asfb::mux(objs, 800);
     pf.packets.push_back(asfb::packet(
         {asfb::compressed(1, 40, 3700, 20, {asfb::pattern(30, 1), asfb::pattern(40, 2)})}, 800));
     const uint32_t n = uint32_t(pf.packets.size());
@@ -89,34 +86,26 @@ Bytes built_file() {
 // places in the data.
 uint64_t next_cut(uint64_t n, const Use& u, bool thread) {
     if (n < std::min<uint64_t>(u.header, 4096)) return n + (thread ? 5 : 1);
-    return n + (n < u.header ? 97 : std::max<uint64_t>(1, (u.size - u.header) / 40));
+    return n + (n < u.header ? 97 : std::max<uint64_t>(1, (u.uses[7] - u.header) / 40));
 }
 
 struct Kind {
     const char* what;
-    uint64_t (*count)(const Use&);
     void (*arm)(Player&, uint64_t n);
     uint64_t stride = 1;       // every use up to the 64th, then every stride-th
     int frames = 0;            // 1: frames are the clean session's; 2: and one at most lost
-    bool cut = false;          // the file itself ends after n - 1 bytes
 };
-const Kind kKinds[] = {
-    {"malloc fails", [](const Use& u) { return u.mallocs; },
-     [](Player& p, uint64_t n) { p.host.fail_malloc_at(n); }, 1, 1},
-    {"stream_alloc refused", [](const Use& u) { return u.allocs; },
-     [](Player& p, uint64_t n) { p.refuse_alloc_at(n); }, 1, 2},
-    {"stream_realloc refused", [](const Use& u) { return u.reallocs; },
-     [](Player& p, uint64_t n) { p.refuse_realloc_at(n); }, 1, 2},
-    {"seeks fail after", [](const Use& u) { return u.seeks; },
+const Kind kKinds[] = {  // the last one cuts the file itself after n - 1 bytes
+    {"malloc fails", [](Player& p, uint64_t n) { p.host.fail_malloc_at(n); }, 1, 1},
+    {"stream_alloc refused", [](Player& p, uint64_t n) { p.refuse_at(0, n); }, 1, 2},
+    {"stream_realloc refused", [](Player& p, uint64_t n) { p.refuse_at(1, n); }, 1, 2},
+    {"seeks fail after",
      [](Player& p, uint64_t n) { p.input().faults().fail_seeks_after = int64_t(n) - 1; }},
-    {"reads end after", [](const Use& u) { return u.reads; },
+    {"reads end after",
      [](Player& p, uint64_t n) { p.input().faults().fail_reads_after = int64_t(n) - 1; }},
-    {"reads shorter than", [](const Use&) { return uint64_t(17); },
-     [](Player& p, uint64_t n) { p.input().faults().max_read = n; }},
-    {"input ends after", [](const Use& u) { return u.size; },
-     [](Player& p, uint64_t n) { p.input().faults().end_after = n - 1; }, 0},
-    {"file cut at", [](const Use& u) { return u.size; }, [](Player&, uint64_t) {}, 0, 0, true},
-};
+    {"reads shorter than", [](Player& p, uint64_t n) { p.input().faults().max_read = n; }},
+    {"input ends after", [](Player& p, uint64_t n) { p.input().faults().end_after = n - 1; }, 0},
+    {"file cut at", [](Player&, uint64_t) {}, 0}};
 
 TEST(FaultSweep, EveryFaultAtEveryUseThroughAWholeSession) {
     std::vector<std::pair<std::string, Bytes>> files = {{"built", built_file()}};
@@ -129,15 +118,15 @@ TEST(FaultSweep, EveryFaultAtEveryUseThroughAWholeSession) {
             const Use clean = session(file, b, [](Player&) {});
             ASSERT_GT(clean.frames.size(), 5u) << name;
             for (const Kind& k : kKinds) {
-                const uint64_t total = k.count(clean);
+                const bool cut = &k == std::end(kKinds) - 1;
+                const uint64_t total = clean.uses[size_t(&k - kKinds)];
                 for (uint64_t n = 1; n <= total + 1;
                      n = k.stride ? n + (n < 64 ? 1 : k.stride * (thread ? 17 : 1))
                                   : next_cut(n, clean, thread)) {
-                    SCOPED_TRACE(testing::Message() << name << ", " << host::buffering_name(b)
-                                                    << ", " << k.what << " " << n << " of "
-                                                    << total);
-                    const Bytes cut(file.begin(), file.begin() + long(k.cut ? n - 1 : 0));
-                    const Use u = session(k.cut ? cut : file, b, [&](Player& p) { k.arm(p, n); });
+                    SCOPED_TRACE(testing::Message() << name << ", " << host::buffering_name(b) << ", "
+                                                    << k.what << " " << n << " of " << total);
+                    const Bytes part(file.begin(), file.begin() + long(cut ? n - 1 : 0));
+                    const Use u = session(cut ? part : file, b, [&](Player& p) { k.arm(p, n); });
                     size_t known = 0;
                     for (const auto& f : u.frames) known += clean.frames.count(f) > 0;
                     EXPECT_TRUE(k.stride || n > clean.header || u.frames.empty());

@@ -7,6 +7,7 @@
 
 #include <algorithm>
 #include <filesystem>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -42,9 +43,8 @@ TEST(Regress, FuzzFindingsReplayCleanly) {
         {0, 0x7FFFFFFFFFFFFFFFull},
         {0xFFFFFFFFFFFFFFFFull, 0x8000000000000000ull}};
     for (const auto& [play_duration, preroll] : extremes) {
-        asfb::FileProps fp;
-        fp.play_duration = play_duration, fp.preroll = preroll, fp.packet_count = 2;
-        const auto f = testsupport::file_with({asfb::audio_stream(1)}, fp);
+        const auto f = testsupport::file_with(
+            {asfb::audio_stream(1)}, {.packet_count = 2, .play_duration = play_duration, .preroll = preroll});
         auto o = testsupport::open_file(f);
         ASSERT_EQ(o.rc, HOVA_OK);
         EXPECT_EQ(o.ctx()->s.duration, static_cast<int64_t>(play_duration / 10 - preroll * 1000));
@@ -73,11 +73,9 @@ TEST(Regress, FuzzFindingsReplayCleanly) {
         {"reader_ops", [](const uint8_t* d, size_t n) { (void)readerfuzz::ops_input(d, n); }}};
     for (const auto& [target, replay] : targets) {
         std::error_code ec;
-        std::vector<fs::path> kept;
-        for (const auto& e : fs::directory_iterator(
-                 fs::path(PLIMO_SOURCE_DIR) / "tests/regress/inputs" / target, ec))
-            if (e.is_regular_file()) kept.push_back(e.path());
-        std::sort(kept.begin(), kept.end());
+        std::set<fs::path> kept;  // in name order
+        for (const auto& e : fs::directory_iterator(fs::path(PLIMO_SOURCE_DIR) / "tests/regress/inputs" / target, ec))
+            if (e.is_regular_file()) kept.insert(e.path());
         for (const auto& path : kept) rows.push_back({replay, testenv::read_file_or_empty(path)});
     }
     for (size_t i = 0; i < rows.size(); ++i) {
