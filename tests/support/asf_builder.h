@@ -60,9 +60,8 @@ Bytes waveformat_extensible(const WaveFormat& base, const guid_st& sub, const By
 // The base subformat GUID carrying a format tag in its first field.
 guid_st tag_subformat(uint16_t tag);
 
-struct BitmapInfo {
-    int32_t width = 320, height = 240; std::string fourcc = "WMV3"; Bytes codec_private;  // file order
-};
+// The FourCC in file order.
+struct BitmapInfo { int32_t width = 320, height = 240; std::string fourcc = "WMV3"; Bytes codec_private; };
 Bytes bitmapinfoheader(const BitmapInfo& b);
 // Video type-specific data: encoded width, height, flags, format data size,
 // then the BITMAPINFOHEADER.
@@ -82,8 +81,7 @@ struct ExtStreamProps {
     uint32_t bitrate = 128000; uint16_t stream_num = 1, language_index = 0;
     uint64_t avg_time_per_frame = 0;                      // 100-ns units
     std::vector<std::pair<uint16_t, std::string>> names;  // (language index, name)
-    std::vector<PayloadExtSystem> ext_systems;
-    Bytes embedded_stream;  // a whole stream properties object, or empty
+    std::vector<PayloadExtSystem> ext_systems; Bytes embedded_stream;  // a stream properties object, or empty
 };
 Bytes extended_stream_properties(const ExtStreamProps& e, Size declared = {});
 Bytes language_list(const std::vector<std::string>& tags, Size declared = {});
