@@ -17,10 +17,7 @@ Writer& Writer::guid(const guid_st& g) {
 }
 
 Writer& Writer::utf16(const std::string& text) {
-    for (char c : text) {
-        if (static_cast<uint8_t>(c) >= 0x80) throw std::invalid_argument("utf16: ASCII only");
-        u16(static_cast<uint8_t>(c));
-    }
+    for (char c : text) u16(static_cast<uint8_t>(c) < 0x80 ? c : throw std::invalid_argument("ASCII only"));
     return u16(0);
 }
 
@@ -50,11 +47,7 @@ Bytes waveformatex(const WaveFormat& f) {
         .u16(f.block_align).u16(f.bits_per_sample).u16(f.extra.size()).bytes(f.extra).out;
 }
 
-guid_st tag_subformat(uint16_t tag) {
-    guid_st g = wfex_guid;
-    g.data1 = tag;
-    return g;
-}
+guid_st tag_subformat(uint16_t tag) { guid_st g = wfex_guid; return g.data1 = tag, g; }
 
 Bytes waveformat_extensible(const WaveFormat& base, const guid_st& sub, const Bytes& tail) {
     WaveFormat f = base;
@@ -113,8 +106,7 @@ Bytes language_list(const std::vector<std::string>& tags, Size declared) {
 Bytes header_extension(const std::vector<Bytes>& children, Size declared, uint16_t reserved2) {
     const Bytes body = Writer().all(children).out;
     return object(asf_header_extension_object,
-                  Writer().guid(asf_reserved_1).u16(reserved2).u32(body.size()).bytes(body).out,
-                  declared);
+                  Writer().guid(asf_reserved_1).u16(reserved2).u32(body.size()).bytes(body).out, declared);
 }
 
 Bytes content_description(const std::array<std::string, 5>& c, Size declared) {
@@ -137,8 +129,7 @@ Bytes extended_content_description(const std::vector<Descriptor>& ds, Size decla
 Bytes string_value(const std::string& text) { return Writer().utf16(text).out; }
 
 Bytes header_object(const std::vector<Bytes>& children, Size declared) {
-    return object(asf_header_object, Writer().u32(children.size()).u8(1).u8(2).all(children).out,
-                  declared);
+    return object(asf_header_object, Writer().u32(children.size()).u8(1).u8(2).all(children).out, declared);
 }
 
 Bytes data_object(const std::vector<Bytes>& packets, Size declared) {

@@ -24,7 +24,7 @@ using Size = std::optional<uint64_t>;
 struct Writer {
     Bytes out;
     Writer& le(uint64_t v, int n) {
-        for (int i = 0; i < n; ++i) out.push_back(static_cast<uint8_t>(v >> (8 * i)));
+        for (int i = 0; i < n; ++i) out.push_back(uint8_t(v >> (8 * i)));
         return *this;
     }
     Writer& u8(uint64_t v) { return le(v, 1); }
@@ -32,10 +32,7 @@ struct Writer {
     Writer& u32(uint64_t v) { return le(v, 4); }
     Writer& u64(uint64_t v) { return le(v, 8); }
     Writer& bytes(const Bytes& b) { return out.insert(out.end(), b.begin(), b.end()), *this; }
-    Writer& all(const std::vector<Bytes>& parts) {
-        for (const Bytes& b : parts) bytes(b);
-        return *this;
-    }
+    Writer& all(const std::vector<Bytes>& parts) { for (const Bytes& b : parts) bytes(b); return *this; }
     Writer& guid(const guid_st& g);
     // UTF-8 text as terminated UTF-16LE (BMP only).
     Writer& utf16(const std::string& text);
@@ -49,16 +46,13 @@ Bytes object(const guid_st& guid, const Bytes& body, Size declared = {});
 struct FileProps {
     // Durations in 100-ns units (the play duration with the preroll), preroll in ms.
     uint64_t packet_count = 1, play_duration = 50000000, send_duration = 20000000, preroll = 3000;
-    uint32_t flags = 0x2;                          // seekable, not broadcast
-    uint32_t min_packet_size = 3200, max_packet_size = 3200;
+    uint32_t flags = 0x2, min_packet_size = 3200, max_packet_size = 3200;  // flags: seekable, not broadcast
 };
 Bytes file_properties(const FileProps& p, Size declared = {});
 
 struct WaveFormat {
-    uint16_t format_tag = 0x0161, channels = 2;
-    uint32_t sample_rate = 44100, bytes_per_second = 16000;
-    uint16_t block_align = 1485, bits_per_sample = 16;
-    Bytes extra;  // bytes behind cbSize
+    uint16_t format_tag = 0x0161, channels = 2; uint32_t sample_rate = 44100, bytes_per_second = 16000;
+    uint16_t block_align = 1485, bits_per_sample = 16; Bytes extra;  // extra: bytes behind cbSize
 };
 Bytes waveformatex(const WaveFormat& w);
 // WAVE_FORMAT_EXTENSIBLE around `sub` (subformat GUID), `tail` behind it.
@@ -66,11 +60,8 @@ Bytes waveformat_extensible(const WaveFormat& base, const guid_st& sub, const By
 // The base subformat GUID carrying a format tag in its first field.
 guid_st tag_subformat(uint16_t tag);
 
-struct BitmapInfo {
-    int32_t width = 320, height = 240;
-    std::string fourcc = "WMV3";  // four characters in file order
-    Bytes codec_private;
-};
+// The FourCC in file order.
+struct BitmapInfo { int32_t width = 320, height = 240; std::string fourcc = "WMV3"; Bytes codec_private; };
 Bytes bitmapinfoheader(const BitmapInfo& b);
 // Video type-specific data: encoded width, height, flags, format data size,
 // then the BITMAPINFOHEADER.
@@ -78,9 +69,7 @@ Bytes video_type_specific(const BitmapInfo& b);
 
 struct StreamProps {
     guid_st stream_type = asf_audio_media, ec_type = {};  // no error correction
-    uint64_t time_offset = 0;  // 100-ns units
-    uint16_t flags = 1;        // stream number in bits 0-6
-    Bytes type_specific, ec_data;
+    uint64_t time_offset = 0; uint16_t flags = 1; Bytes type_specific, ec_data;  // 100-ns; number in bits 0-6
 };
 Bytes stream_properties(const StreamProps& s, Size declared = {});
 Bytes audio_stream(uint16_t number, const WaveFormat& w = {});
@@ -89,17 +78,14 @@ Bytes video_stream(uint16_t number, const BitmapInfo& b = {});
 // ---- header extension ----
 struct PayloadExtSystem { guid_st id = {}; uint16_t data_size = 0xFFFF; Bytes info; };
 struct ExtStreamProps {
-    uint32_t bitrate = 128000;
-    uint16_t stream_num = 1, language_index = 0;
+    uint32_t bitrate = 128000; uint16_t stream_num = 1, language_index = 0;
     uint64_t avg_time_per_frame = 0;                      // 100-ns units
     std::vector<std::pair<uint16_t, std::string>> names;  // (language index, name)
-    std::vector<PayloadExtSystem> ext_systems;
-    Bytes embedded_stream;  // a whole stream properties object, or empty
+    std::vector<PayloadExtSystem> ext_systems; Bytes embedded_stream;  // a stream properties object, or empty
 };
 Bytes extended_stream_properties(const ExtStreamProps& e, Size declared = {});
 Bytes language_list(const std::vector<std::string>& tags, Size declared = {});
-Bytes header_extension(const std::vector<Bytes>& children, Size declared = {},
-                       uint16_t reserved2 = 6);
+Bytes header_extension(const std::vector<Bytes>& children, Size declared = {}, uint16_t reserved2 = 6);
 
 // ---- descriptive metadata ----
 // Title, author, copyright, description, rating.
@@ -120,8 +106,7 @@ Bytes simple_index(uint64_t interval_100ns, const std::vector<IndexEntry>& entri
 // objects, unknown objects).
 struct File {
     uint32_t id3_payload = 0;  // 0: no ID3 prefix
-    std::vector<Bytes> header_children, packets, trailing;
-    Size data_object_size;  // declared; default: what it holds
+    std::vector<Bytes> header_children, packets, trailing; Size data_object_size;  // declared; default: real
 };
 Bytes build(const File& f);
 

@@ -8,21 +8,18 @@
 
 namespace asfb {
 
-namespace {
+static int width(uint8_t type) { return type == 3 ? 4 : type; }
+static Bytes cut(Bytes b, uint32_t size) { return b.resize(size), b; }
 
-int width(uint8_t type) { return type == 3 ? 4 : type; }
-
-uint32_t header_size(const PacketLayout& l) {
+static uint32_t header_size(const PacketLayout& l) {
     return (l.error_correction ? 3 : 0) + 8 + width(l.packet_len_type) + width(l.sequence_type) +
            width(l.padding_len_type) + l.multiple;
 }
 
-uint32_t payload_header_size(const PacketLayout& l, const Payload& p) {
+static uint32_t payload_header_size(const PacketLayout& l, const Payload& p) {
     return 1 + width(l.object_num_type) + width(l.offset_type) + width(l.replicated_len_type) +
            static_cast<uint32_t>(p.replicated.size()) + (l.multiple ? width(l.payload_len_type) : 0);
 }
-
-}  // namespace
 
 Payload media(uint8_t stream, uint32_t object_num, uint32_t offset, uint32_t object_size,
               uint32_t pts_ms, Bytes data, bool key, uint32_t extra) {
@@ -38,10 +35,7 @@ Payload untimed(uint8_t stream, uint32_t object_num, uint32_t offset, Bytes data
 Payload compressed(uint8_t stream, uint32_t object_num, uint32_t pts_ms, uint8_t delta_ms,
                    const std::vector<Bytes>& subs, bool key) {
     Writer w;
-    for (const Bytes& s : subs) {
-        if (s.size() > 255) throw std::invalid_argument("sub-payload longer than 255 bytes");
-        w.u8(s.size()).bytes(s);
-    }
+    for (const Bytes& s : subs) w.u8(s.size() < 256 ? s.size() : throw std::invalid_argument("sub")).bytes(s);
     return {stream, key, object_num, pts_ms, {delta_ms}, w.out};
 }
 
@@ -83,16 +77,12 @@ Bytes damaged_packet(Damage how, const std::vector<Payload>& payloads, uint32_t 
     if (how == Damage::PaddingTooLong) l.padding_len = packet_size + 1;
     if (how == Damage::NoPayloads) l.num_payloads = 0;
     if (how == Damage::PayloadTooLong) ps.at(0).declared_len = packet_size + 1;
-    Bytes out = packet(ps, packet_size, l);
-    out.resize(packet_size);
-    return out;
+    return cut(packet(ps, packet_size, l), packet_size);
 }
 
 Bytes misaligned_packet(const Bytes& junk, const std::vector<Payload>& payloads,
                         uint32_t packet_size, const PacketLayout& layout) {
-    Bytes out = Writer().bytes(junk).bytes(packet(payloads, packet_size, layout)).out;
-    out.resize(packet_size);
-    return out;
+    return cut(Writer().bytes(junk).bytes(packet(payloads, packet_size, layout)).out, packet_size);
 }
 
 std::vector<Bytes> mux(const std::vector<Object>& objects, uint32_t packet_size,
@@ -114,10 +104,7 @@ std::vector<Bytes> mux(const std::vector<Object>& objects, uint32_t packet_size,
         do {
             Payload p = media(o.stream, num, offset, size, o.pts_ms, {}, o.key);
             const uint32_t head = payload_header_size(l, p);
-            if (used + head >= limit || (!l.multiple && !current.empty())) {
-                flush();
-                continue;
-            }
+            if (used + head >= limit || (!l.multiple && !current.empty())) { flush(); continue; }
             const uint32_t take = std::min(limit - used - head, size - offset);
             p.data.assign(o.data.begin() + offset, o.data.begin() + offset + take);
             current.push_back(std::move(p));

@@ -16,12 +16,9 @@ namespace asfb {
 // One payload. Replicated data is written verbatim; `media()` and
 // `compressed()` make the usual forms.
 struct Payload {
-    uint8_t stream = 1;
-    bool key = false;
-    uint32_t object_num = 0;
-    uint32_t offset = 0;  // offset into the object; presentation time when compressed
-    Bytes replicated;
-    Bytes data;  // payload data (sub-payloads already framed when compressed)
+    uint8_t stream = 1; bool key = false;
+    uint32_t object_num = 0, offset = 0;  // offset into the object; presentation time when compressed
+    Bytes replicated, data;  // data: sub-payloads already framed when compressed
     std::optional<uint32_t> declared_len;  // payload length field; default data.size()
 };
 
@@ -31,8 +28,8 @@ Payload media(uint8_t stream, uint32_t object_num, uint32_t offset, uint32_t obj
               uint32_t pts_ms, Bytes data, bool key = false, uint32_t extra = 0);
 // A payload with `replicated_len` (0 or 2 to 7) bytes of replicated data that
 // carries no size or time.
-Payload untimed(uint8_t stream, uint32_t object_num, uint32_t offset, Bytes data,
-                uint32_t replicated_len, bool key = false);
+Payload untimed(uint8_t stream, uint32_t object_num, uint32_t offset, Bytes data, uint32_t replicated_len,
+                bool key = false);
 // A compressed payload: sub-payloads of whole small objects, the first at
 // `pts_ms`, each following one `delta_ms` later.
 Payload compressed(uint8_t stream, uint32_t object_num, uint32_t pts_ms, uint8_t delta_ms,
@@ -42,8 +39,7 @@ Payload compressed(uint8_t stream, uint32_t object_num, uint32_t pts_ms, uint8_t
 // Error correction, when present, is two bytes of zeros; send time and
 // duration are zero.
 struct PacketLayout {
-    bool error_correction = true;
-    bool multiple = true;  // multiple-payloads flag (forced on for 2+ payloads)
+    bool error_correction = true, multiple = true;  // multiple-payloads flag (forced on for 2+ payloads)
     uint8_t packet_len_type = 0, sequence_type = 0, padding_len_type = 2;
     uint8_t replicated_len_type = 1, offset_type = 3, object_num_type = 1;
     uint8_t payload_len_type = 2;  // multiple payloads only
@@ -54,8 +50,7 @@ struct PacketLayout {
 
 // A packet of exactly `packet_size` bytes (padding at the end). When the
 // payloads do not fit the packet grows; tests that want that say so.
-Bytes packet(const std::vector<Payload>& payloads, uint32_t packet_size,
-             const PacketLayout& layout = {});
+Bytes packet(const std::vector<Payload>& payloads, uint32_t packet_size, const PacketLayout& layout = {});
 
 // Damage a packet the way delivery rejects it: the packet length field, the
 // padding length field or the first payload's length field says
@@ -65,8 +60,8 @@ Bytes damaged_packet(Damage how, const std::vector<Payload>& payloads, uint32_t 
 
 // `junk` bytes, then a good packet, cut back to `packet_size` bytes: the
 // packet starts off the grid and is only found by the resync scan.
-Bytes misaligned_packet(const Bytes& junk, const std::vector<Payload>& payloads,
-                        uint32_t packet_size, const PacketLayout& layout = {});
+Bytes misaligned_packet(const Bytes& junk, const std::vector<Payload>& payloads, uint32_t packet_size,
+                        const PacketLayout& layout = {});
 
 // One media object to mux.
 struct Object { uint8_t stream; uint32_t pts_ms; Bytes data; bool key = false; };
@@ -75,8 +70,7 @@ struct Object { uint8_t stream; uint32_t pts_ms; Bytes data; bool key = false; }
 // `first_object_num`. `fill` (0: the packet size) caps the bytes used in
 // each packet, leaving the rest as padding.
 std::vector<Bytes> mux(const std::vector<Object>& objects, uint32_t packet_size,
-                       const PacketLayout& layout = {}, uint8_t first_object_num = 1,
-                       uint32_t fill = 0);
+                       const PacketLayout& layout = {}, uint8_t first_object_num = 1, uint32_t fill = 0);
 
 // Scrambles an audio object the way a spread-audio encoder stores it (the
 // inverse of the demuxer's reordering).
@@ -89,14 +83,11 @@ Bytes pattern(size_t n, uint32_t seed);
 // preroll), an audio stream 1 and/or a video stream 2 (optionally with
 // spread audio), the packets, then `trailing` objects.
 struct PacketFile {
-    uint32_t packet_size = 1024;
-    uint64_t preroll_ms = 0;
-    bool audio = true, video = true;
+    uint32_t packet_size = 1024; uint64_t preroll_ms = 0; bool audio = true, video = true;
     std::optional<uint64_t> packet_count;  // default: packets.size()
     uint64_t audio_time_offset = 0;        // 100-ns units
     struct { uint8_t span = 0; uint16_t packet_len = 0, chunk_len = 0; } spread;
-    std::vector<Bytes> packets, trailing;
-    bool broadcast = false;
+    std::vector<Bytes> packets, trailing; bool broadcast = false;
     std::optional<uint64_t> data_object_size;  // declared (50: a recorded live stream's)
 };
 Bytes build_packet_file(const PacketFile& f);

@@ -26,11 +26,9 @@ std::string corpus_file(const std::string& name) {
 std::vector<std::string> corpus_files() {
     std::vector<std::string> out;
     std::error_code ec;
-    for (const auto& e : std::filesystem::directory_iterator(corpus_dir(), ec)) {
-        const std::string x = e.path().extension().string();
-        if (x == ".asf" || x == ".wmv" || x == ".wma")
+    for (const auto& e : std::filesystem::directory_iterator(corpus_dir(), ec))
+        if (const std::string x = e.path().extension().string(); x == ".asf" || x == ".wmv" || x == ".wma")
             out.push_back(corpus_dir() + "/" + e.path().filename().string());
-    }
     std::sort(out.begin(), out.end());
     return out;
 }
@@ -54,8 +52,7 @@ int run_command(const std::string& cmd, std::string* out) {
     if (!p) return -1;
     char buf[4096];
     if (out) out->clear();
-    for (size_t n; (n = std::fread(buf, 1, sizeof buf, p)) > 0;)
-        if (out) out->append(buf, n);
+    for (size_t n; (n = std::fread(buf, 1, sizeof buf, p)) > 0;) if (out) out->append(buf, n);
     const int status = ::pclose(p);
     return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
 }

@@ -41,7 +41,6 @@ private:
 }  // namespace testenv
 
 // Skips the current test with a message when a corpus file is missing.
-#define REQUIRE_CORPUS_FILE(var, name)                                            \
-    const std::string var = testenv::corpus_file(name);                           \
-    if (var.empty()) GTEST_SKIP() << "corpus file " << (name) << " not found in " \
-                                  << testenv::corpus_dir()
+#define REQUIRE_CORPUS_FILE(var, name)                  \
+    const std::string var = testenv::corpus_file(name); \
+    if (var.empty()) GTEST_SKIP() << "corpus file " << (name) << " not found in " << testenv::corpus_dir()
