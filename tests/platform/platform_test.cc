@@ -1,29 +1,13 @@
-// The log switch and call shape; and UTF-16LE to UTF-8: each unit encoded on
-// its own, a terminator appended when the range has none, the measured size
-// always equal to what is written.
+// UTF-16LE to UTF-8: each unit encoded on its own, a terminator appended when
+// the range has none, the measured size always equal to what is written.
 #include <gtest/gtest.h>
 
 #include <vector>
 
-#include "dprintf.h"
 #include "plimo_string.h"
 #include "test_env.h"
 
-namespace {
-
 using Bytes = std::vector<uint8_t>;
-
-TEST(Log, MessagesGoOutAtDebugUnderTheTagWhileTheSwitchIsZero) {
-    testenv::LogCapture log;
-    ASSERT_EQ(get_kesto_disable_log(), 0) << "logging starts on";
-    ASF_LOG("open %d\n", 7);
-    kesto_disable_log = 5;
-    SYS_LOG("suppressed\n");
-    kesto_disable_log = 0;
-    ASSERT_EQ(log.lines().size(), 1u) << "nothing is written while the switch is set";
-    EXPECT_EQ(std::make_tuple(log.lines()[0].text, log.lines()[0].priority, log.lines()[0].tag),
-              std::make_tuple("[ASF] open 7\n", int(ANDROID_LOG_DEBUG), "[PLIMO]"));
-}
 
 Bytes units(std::initializer_list<uint16_t> us) {
     Bytes b;
@@ -63,5 +47,3 @@ TEST(Utf16ToUtf8, MeasuresAndConvertsEachUnitWithinTheRange) {
     EXPECT_EQ(log.lines()[0].text + log.lines()[2].text, "calculate UTF16 to UTF8 error : invalid "
               "input\nconvert UTF16 to UTF8 error : target is NULL or invalid input\n");
 }
-
-}  // namespace

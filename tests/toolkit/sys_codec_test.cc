@@ -1,11 +1,8 @@
 // Codec configuration parsers: the bit reader, AAC (AudioSpecificConfig, ADTS,
-// LOAS/LATM, config writer), AC-3/E-AC-3 channel counts.
+// LOAS/LATM, config writer).
 #include "bit_reader.h"
 #include "sys_aac.h"
-#include "sys_ac3.h"
 #include "toolkit_fixture.h"
-
-namespace {
 
 using namespace tkb;
 
@@ -92,18 +89,3 @@ TEST_F(Config, AacWritesTwoOrFiveBytesIntoANewBlockOrTheCallersBuffer) {
     sys_update_aac_config(&d, &p, &len, &cases[0].first);
     EXPECT_EQ(std::make_pair(p, len), std::make_pair(static_cast<uint8_t*>(nullptr), 0u));
 }
-
-TEST(Ac3Channels, FindLfeAfterTheModeFields) {
-    const int full_range[8] = {2, 1, 2, 3, 3, 4, 4, 5};
-    for (int acmod = 0; acmod < 16; ++acmod) {
-        int ac3 = -1, eac3 = -1, lfe = acmod / 8;
-        EXPECT_EQ(sys_get_ac3_channel_count(ac3_frame(acmod % 8, lfe).data(), 16, 0, &ac3) +
-                  sys_get_ac3_channel_count(eac3_frame(acmod % 8, lfe).data(), 13, 1, &eac3), 2);
-        EXPECT_EQ(ac3 * 10 + eac3, (full_range[acmod % 8] + lfe) * 11) << acmod;
-    }
-    int channels = -1;  // frame size codes past 37 are no header
-    const Bytes two = cat({ac3_frame(7, 1, 38, 0), ac3_frame(2, 0, 37)});
-    EXPECT_EQ(sys_get_ac3_channel_count(two.data(), int(two.size()), 0, &channels) * channels, 2);
-}
-
-}  // namespace

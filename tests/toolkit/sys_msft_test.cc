@@ -8,8 +8,6 @@
 #include "sys_msft.h"
 #include "toolkit_fixture.h"
 
-namespace {
-
 using asfb::Bytes;
 
 // A reader standing at the start of `bytes`, and a stream with a configuration
@@ -20,14 +18,12 @@ protected:
         close();
         input = host::RawInput::from_memory(bytes, {.disable_cache = true});
         ASSERT_EQ(OpenURL(&d.cbuffer, input->io(), 0, host.table()), 0);
-        s = {};
+        s = {}, s.config_len = config_len;
         s.config = config_len ? static_cast<uint8_t*>(sys_malloc(&d, config_len)) : nullptr;
-        s.config_len = config_len;
     }
     void close() {
         if (input) CloseURL(&d.cbuffer, &d.callback);
-        input.reset();
-        release(s.config);
+        input.reset(), release(s.config);
     }
     void TearDown() override { close(), HostedToolkit::TearDown(); }
     Bytes config() const { return Bytes(s.config, s.config + s.config_len); }
@@ -64,13 +60,14 @@ TEST_F(MsftParse, AudioConfigKeepsWholeHeaderOrOnlyCodecDataAndStopsAtShortInput
     uint32_t all = uint32_t(wma2_hdr.size());
     ASSERT_EQ(sys_msft_parse_audio_header(&d, &s, &all), HOVA_OK);
     EXPECT_EQ(std::make_pair(s.config_len, all), std::make_pair(0u, 12u));
-    load(wma2_hdr, 15);  // fewer than 16 bytes announced
-    uint32_t unread = 15;
-    EXPECT_EQ(sys_msft_parse_audio_header(&d, &s, &unread), HOVA_EndOfStream);
-    load(Bytes(wma2_hdr.begin(), wma2_hdr.begin() + 20), 28);  // the input ends in the extra bytes
-    unread = 28;
-    EXPECT_EQ(sys_msft_parse_audio_header(&d, &s, &unread), HOVA_EndOfStream);
-    EXPECT_EQ(std::make_pair(s.info.aud.sample_rate, unread), std::make_pair(44100u, 8u));
+    // Fewer than 16 bytes announced; the input ends in the extra bytes.
+    for (const auto& [w, n, left] : {std::tuple{wma2_hdr, 15u, 15u}, {Bytes(&wma2_hdr[0], &wma2_hdr[20]), 28u, 8u}}) {
+        load(w, n);
+        uint32_t unread = n;
+        const int r = sys_msft_parse_audio_header(&d, &s, &unread);
+        EXPECT_EQ(std::make_pair(r, unread), std::make_pair(int(HOVA_EndOfStream), left));
+    }
+    EXPECT_EQ(s.info.aud.sample_rate, 44100u);
 }
 
 TEST_F(MsftParse, VideoHeaderTakesLow16BitsAndPrivateData) {
@@ -91,5 +88,3 @@ TEST_F(MsftParse, VideoHeaderTakesLow16BitsAndPrivateData) {
     uint32_t unread = 40, fourcc = 0;
     EXPECT_EQ(sys_msft_parse_video_header(&d, &s, &unread, &fourcc), HOVA_EndOfStream);
 }
-
-}  // namespace

@@ -8,8 +8,6 @@
 #include "sys_demuxer.h"
 #include "streaming.h"
 
-namespace {
-
 constexpr hova_stream_type_et A = HOVA_STREAM_AUDIO, V = HOVA_STREAM_VIDEO;
 
 TEST(PtsGapRepair, KeepsTimelineContinuousAcrossJumpsOfMoreThanThirtySecondsAndLogsThem) {
@@ -62,5 +60,3 @@ TEST(DropTarget, OtherKindsDropUntilTheReaderReachesTheFirstTargetThenForgetIt) 
         EXPECT_EQ(sys_check_drop(&d, &audio), drop) << "reader at " << reader_at;
     }
 }
-
-}  // namespace
