@@ -57,11 +57,9 @@ inline Bytes adts_frame(int sf_index, int channel_config, int payload = 0) {
     return padded(w.put(channel_config, 3).put(0, 4).put(7 + payload, 13).put(0x7FF, 11).put(0, 2).bytes(), payload);
 }
 
-struct LoasLayer {
-    bool use_same_config = false;  // ignored for program 0 layer 0
-    Asc asc;
-    int asc_pad_bits = 0;          // zero bits behind the 13 ASC bits (its length, version 1)
-};
+// use_same_config is ignored for program 0 layer 0; asc_pad_bits: zero bits
+// behind the 13 ASC bits (their count is stored in version 1).
+struct LoasLayer { bool use_same_config = false; Asc asc; int asc_pad_bits = 0; };
 struct LoasConfig {
     bool use_same_stream_mux = false;
     int mux_version = 0;
@@ -131,12 +129,9 @@ inline Bytes be(uint32_t v, int n, int bits = 8) {  // bits 7: syncsafe
 }
 inline Bytes text(const std::string& s) { return Bytes(s.begin(), s.end()); }
 
-struct Id3Frame {
-    std::string id;
-    Bytes body;
-    int64_t stored_size = -1;    // size field as stored (before encoding); -1: body.size()
-    bool plain_size_v4 = false;  // write a v2.4 size big-endian instead of syncsafe
-};
+// stored_size: the size field as stored (-1: body.size()); plain_size_v4: a
+// v2.4 size written big-endian instead of syncsafe.
+struct Id3Frame { std::string id; Bytes body; int64_t stored_size = -1; bool plain_size_v4 = false; };
 inline Id3Frame text_frame(const std::string& id, uint8_t enc, const Bytes& v) { return {id, cat({{enc}, v})}; }
 // The frames of a tag as stored for `version` (2, 3 or 4).
 inline Bytes id3_frames(int version, const std::vector<Id3Frame>& frames) {

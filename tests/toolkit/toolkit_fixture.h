@@ -16,8 +16,7 @@ protected:
         EXPECT_EQ(host.outstanding_blocks(), 0u) << "the host still holds toolkit blocks";
         EXPECT_EQ(host.foreign_frees(), 0u);
     }
-    template <typename T>
-    void release(T*& p) { sys_free(&d, p); }
+    template <typename T> void release(T*& p) { sys_free(&d, p); }
 
     host::HostCallbacks host;
     sys_demuxer_st d{};
