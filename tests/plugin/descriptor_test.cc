@@ -26,8 +26,8 @@ TEST(Descriptor, ProbeFindsTheHeaderGuidAtTheStartOrBehindAnId3Tag) {
     for (const auto& c : cases) {
         auto raw = host::RawInput::from_memory(c.file, {.seekable = c.seekable});
         raw->faults().refuse_seek = c.refuse_seek;
-        EXPECT_EQ(asf_probe(c.file.data(), c.len, raw->io(), HOVA_PROBE_NORMAL), c.expected) << (&c - cases);
-        EXPECT_EQ(raw->position(), 0u);
+        EXPECT_EQ(std::make_pair(asf_probe(c.file.data(), c.len, raw->io(), HOVA_PROBE_NORMAL), raw->position()),
+                  std::make_pair(c.expected, uint64_t{0})) << (&c - cases);
     }
     EXPECT_EQ(asf_probe(tagged.data(), 64, nullptr, HOVA_PROBE_NORMAL) +
               asf_probe(nullptr, 64, nullptr, HOVA_PROBE_NORMAL), 0);

@@ -72,8 +72,7 @@ TEST_F(Config, AacWritesTwoOrFiveBytesIntoANewBlockOrTheCallersBuffer) {
     uint32_t len = 4;
     sys_update_aac_config(&d, &p, &len, &cases[1].first);
     EXPECT_EQ(std::make_pair(buf, len), std::make_pair(Bytes{0x13, 0x90, 0xEE, 0xEE, 0xEE, 0xEE, 0xEE, 0xEE}, 4u));
-    p = nullptr;  // no block to be had: no config
-    host.fail_malloc_at(1);
+    p = nullptr, host.fail_malloc_at(1);  // no block to be had: no config
     sys_update_aac_config(&d, &p, &len, &cases[0].first);
     EXPECT_EQ(std::make_pair(p, len), std::make_pair(static_cast<uint8_t*>(nullptr), 0u));
 }

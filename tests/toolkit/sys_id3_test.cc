@@ -1,12 +1,8 @@
 // ID3 tags read through the reader: where the tag is, frame sizes (syncsafe or
 // not), unsynchronisation, pictures, the ID3v1 block at the end, and numbers.
 #include <climits>
-#include <memory>
 
-#include "raw_input.h"
-#include "streaming.h"
 #include "sys_id3.h"
-#include "test_env.h"
 #include "toolkit_fixture.h"
 
 #pragma GCC diagnostic ignored "-Wmissing-field-initializers"
@@ -82,7 +78,8 @@ TEST_F(Id3, WalksTheFramesOfEveryVersion) {
         ASSERT_EQ(parse(cat({c.tag, kAudio})), 1);
         EXPECT_EQ(std::make_pair(info.eID3TagFlags, cb_tell64(&reader)),
                   std::make_pair(c.flags, cb_fpos(ctx.id3_v2_size))) << "reader stands after the tag";
-        EXPECT_TRUE(!(c.flags & ID3_TITLE) || bytes(info.Title) == c.data) << "title";
+        EXPECT_TRUE(!(c.flags & ID3_TITLE) || (bytes(info.Title) == c.data && !info.Title.payload[c.data.size()]))
+            << "the title, then a NUL";
         EXPECT_TRUE(!c.log_line || log.contains(c.log_line)) << c.log_line;
         if (c.tag[5] & 0x80) { EXPECT_EQ(info.u32ID3TagSize, 11 + c.data.size()); }
         if (c.flags & ID3_APIC) {
@@ -91,9 +88,6 @@ TEST_F(Id3, WalksTheFramesOfEveryVersion) {
                       std::make_tuple(c.data, ctx.id3_info_buffer + c.pic_at, int(c.pic_at)));
         }
     }
-    ASSERT_EQ(parse(cat({cases[1].tag, kAudio})), 1);
-    EXPECT_EQ(std::make_pair(info.Title.stringformat, info.Title.payload[3]),
-              std::make_pair(HOVA_STRING_FORMAT_UTF8, uint8_t{0})) << "text ends with a NUL";
 }
 
 TEST_F(Id3, FindsTheTagInTheFirst257PositionsOrFallsBackToTheId3v1Block) {
@@ -122,9 +116,9 @@ TEST_F(Id3, FindsTheTagInTheFirst257PositionsOrFallsBackToTheId3v1Block) {
         EXPECT_EQ(std::make_tuple(info.eID3TagFlags, bytes(info.Title), ctx.id3_v1_size, cb_tell64(&reader),
                                   program.year, std::string(program.genre)),
                   std::make_tuple(63u, text("Song"s + '\0'), 128, cb_fpos{0}, 1987, "Rock"s));
-        const std::pair<const hova_string_info_st*, int> fields[] = {
-            {&info.Artist, 31}, {&info.Album, 62}, {&info.Year, 93}, {&info.Comment, 98}, {&info.Genre, 129}};
-        for (const auto& [field, at] : fields) EXPECT_EQ(field->payload, ctx.id3_info_buffer + at);
+        for (const auto& [field, at] : {std::pair{&info.Artist, 31}, {&info.Album, 62}, {&info.Year, 93},
+                                        {&info.Comment, 98}, {&info.Genre, 129}})
+            EXPECT_EQ(field->payload, ctx.id3_info_buffer + at);
     }
 }
 
@@ -145,8 +139,7 @@ TEST(Id3Helpers, FrameIdsAtTheEdgeSyncsafeSizesAndNumbersFromLeadingDigits) {
     const uint8_t ids[] = {'T', 'I', 'T', '2', 'a', 'B', 'C', 'D', '9', '0', 'Z', 'A'};
     EXPECT_EQ(std::make_tuple(check_tag(ids, 12, 4), check_tag(ids, 12, 8), check_tag(ids, 12, 9),
                               check_tag(ids, 12, UINT32_MAX - 1)), std::make_tuple(0, 1, -1, -1));
-    const uint8_t high_bits[] = {0x80, 0x81, 0x80, 0x80};
-    EXPECT_EQ(calc_ID3v2_size(high_bits), 1u << 14);
+    EXPECT_EQ(calc_ID3v2_size(reinterpret_cast<const uint8_t*>("\x80\x81\x80\x80")), 1u << 14) << "high bits";
     for (const auto& [textv, value] : std::initializer_list<std::pair<std::string, int>>{
              {"7/10", 7}, {"  -12abc", -12}, {"+7", 7}, {"x12", 0}, {"99999999999", INT_MAX},
              {"-99999999999", INT_MIN}}) {

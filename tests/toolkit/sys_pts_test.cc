@@ -1,9 +1,7 @@
 // Timestamp gap repair and drop targets.
 #include <cstring>
 
-#include "streaming.h"
 #include "sys_pts.h"
-#include "test_env.h"
 #include "toolkit_fixture.h"
 
 constexpr hova_stream_type_et A = HOVA_STREAM_AUDIO, V = HOVA_STREAM_VIDEO;

@@ -1,12 +1,18 @@
-// A common demuxer state wired to the reference host's callbacks. Every test
-// built on it ends by checking that the host holds no block of the toolkit.
+// What the toolkit tests share: the builders, the reference host and its inputs,
+// and a common demuxer state wired to the host's callbacks. Every test built on
+// it ends by checking that the host holds no block of the toolkit.
 #pragma once
 
 #include <gtest/gtest.h>
 
+#include <memory>
+
 #include "callbacks.h"
+#include "raw_input.h"
+#include "streaming.h"
 #include "sys_demuxer.h"
 #include "sys_output.h"
+#include "test_env.h"
 #include "toolkit_builders.h"
 
 class HostedToolkit : public ::testing::Test {
