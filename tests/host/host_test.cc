@@ -10,11 +10,10 @@ TEST(HostCallbacks, CountBlocksRecordMisuseAndFailAsAskedFor) {
     host::HostCallbacks cb;
     const hova_callback_st* t = cb.table();
     cb.fail_malloc_at(2);
-    void* got[] = {t->malloc(t->context, 8), t->malloc(t->context, 8), t->malloc(t->context, 0), nullptr};
+    int on_stack = 0;
+    void* got[] = {t->malloc(t->context, 8), t->malloc(t->context, 8), t->malloc(t->context, 0), &on_stack};
     EXPECT_TRUE(got[0] && !got[1] && got[2]);
     EXPECT_EQ(cb.outstanding_blocks() * 100 + cb.outstanding_bytes(), 208u);
-    int on_stack = 0;
-    got[3] = &on_stack;
     for (void*& p : got) t->freep(t->context, &p);
     EXPECT_EQ(cb.outstanding_blocks() * 100 + cb.foreign_frees(), 1u);
     void* buf = nullptr;

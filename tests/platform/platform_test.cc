@@ -1,29 +1,12 @@
-// The log switch and call shape; and UTF-16LE to UTF-8: each unit encoded on
-// its own, a terminator appended when the range has none, the measured size
-// always equal to what is written.
+// UTF-16LE to UTF-8: each unit encoded on its own, a terminator appended when
+// the range has none, the measured size always equal to what is written.
 #include <gtest/gtest.h>
 
 #include <vector>
 
-#include "dprintf.h"
 #include "plimo_string.h"
-#include "test_env.h"
-
-namespace {
 
 using Bytes = std::vector<uint8_t>;
-
-TEST(Log, MessagesGoOutAtDebugUnderTheTagWhileTheSwitchIsZero) {
-    testenv::LogCapture log;
-    ASSERT_EQ(get_kesto_disable_log(), 0) << "logging starts on";
-    ASF_LOG("open %d\n", 7);
-    kesto_disable_log = 5;
-    SYS_LOG("suppressed\n");
-    kesto_disable_log = 0;
-    ASSERT_EQ(log.lines().size(), 1u) << "nothing is written while the switch is set";
-    EXPECT_EQ(std::make_tuple(log.lines()[0].text, log.lines()[0].priority, log.lines()[0].tag),
-              std::make_tuple("[ASF] open 7\n", int(ANDROID_LOG_DEBUG), "[PLIMO]"));
-}
 
 Bytes units(std::initializer_list<uint16_t> us) {
     Bytes b;
@@ -53,15 +36,9 @@ TEST(Utf16ToUtf8, MeasuresAndConvertsEachUnitWithinTheRange) {
                                 get_UTF16_byte_length(t, t + 1), get_UTF16_byte_length(t + 2, t),
                                 get_UTF16_byte_length(t, t + 2), get_UTF16_byte_length(z + 1, z + 4)}),
               std::vector<int>({4, 2, 1, 0, 2, 3}));
-    uint8_t out[8] = {0x55};
-    testenv::LogCapture log;
+    uint8_t out[8] = {0x55};  // an empty or inverted range, no target: nothing measured or written
     EXPECT_EQ(calculate_UTF16_to_UTF8_size(t, t), 0);
     convert_UTF16_to_UTF8(t, t + 2, nullptr);
     convert_UTF16_to_UTF8(t + 2, t, out);
     EXPECT_EQ(out[0], 0x55) << "nothing written for an inverted range";
-    ASSERT_EQ(log.lines().size(), 3u);
-    EXPECT_EQ(log.lines()[0].text + log.lines()[2].text, "calculate UTF16 to UTF8 error : invalid "
-              "input\nconvert UTF16 to UTF8 error : target is NULL or invalid input\n");
 }
-
-}  // namespace

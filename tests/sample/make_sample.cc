@@ -18,8 +18,7 @@ int main(int argc, char** argv) {
     file.packets = asfb::mux(objects, 2048);
     asfb::FileProps fp;
     fp.packet_count = file.packets.size();
-    fp.min_packet_size = fp.max_packet_size = 2048;
-    fp.preroll = 3000;  // ms
+    fp.min_packet_size = fp.max_packet_size = 2048, fp.preroll = 3000;  // ms
     fp.play_duration = 5000 * 10000ull, fp.send_duration = 2000 * 10000ull;
     file.header_children = {
         asfb::file_properties(fp), asfb::audio_stream(1), asfb::video_stream(2),

@@ -1,28 +1,13 @@
-// Codec configuration parsers: the bit reader, AAC (AudioSpecificConfig, ADTS,
-// LOAS/LATM, config writer), AC-3/E-AC-3 channel counts.
+// AAC configuration parsers: LATM values, AudioSpecificConfig, ADTS, LOAS/LATM
+// and the config writer.
 #include "bit_reader.h"
 #include "sys_aac.h"
-#include "sys_ac3.h"
 #include "toolkit_fixture.h"
-
-namespace {
 
 using namespace tkb;
 
-TEST(BitReader, ReadsMostSignificantBitFirstSkipsAndGivesZerosPastTheEnd) {
-    const Bytes data = {0xA5, 0x3C, 0xFF, 0x01, 0x80};
-    // (width, value); a negative width skips that many bits.
-    const std::vector<std::pair<int64_t, uint32_t>> cases[] = {
-        {{1, 1}, {1, 0}, {4, 0x9}, {8, 0x4F}, {24, 0x3FC060}}, {{36, 0x53CFF018}, {8, 0}, {24, 0}},
-        {{4, 0xA}, {-12, 0}, {8, 0xFF}, {-0xFFFFFFFFll, 0}, {16, 0}}};
-    for (const auto& ops : cases) {
-        buffer_bitstream_st bs;
-        buf_stream_init(&bs, data.data(), int(data.size()));
-        for (const auto& [width, value] : ops) {
-            if (width < 0) buf_bit_skip(&bs, uint32_t(-width));
-            else EXPECT_EQ(buf_bit_read(&bs, int(width)), value) << (&ops - cases) << " " << width;
-        }
-    }
+// LatmGetValue's widths: one to four bytes.
+TEST(BitReader, ReadsLatmValuesOfEveryWidth) {
     for (uint32_t v : {0x7Fu, 0x1234u, 0xABCDEFu, 0x89ABCDEFu}) {
         const Bytes b = BitWriter().latm_value(v).put(0x5, 3).bytes();
         buffer_bitstream_st bs;
@@ -87,23 +72,7 @@ TEST_F(Config, AacWritesTwoOrFiveBytesIntoANewBlockOrTheCallersBuffer) {
     uint32_t len = 4;
     sys_update_aac_config(&d, &p, &len, &cases[1].first);
     EXPECT_EQ(std::make_pair(buf, len), std::make_pair(Bytes{0x13, 0x90, 0xEE, 0xEE, 0xEE, 0xEE, 0xEE, 0xEE}, 4u));
-    p = nullptr;  // no block to be had: no config
-    host.fail_malloc_at(1);
+    p = nullptr, host.fail_malloc_at(1);  // no block to be had: no config
     sys_update_aac_config(&d, &p, &len, &cases[0].first);
     EXPECT_EQ(std::make_pair(p, len), std::make_pair(static_cast<uint8_t*>(nullptr), 0u));
 }
-
-TEST(Ac3Channels, FindLfeAfterTheModeFields) {
-    const int full_range[8] = {2, 1, 2, 3, 3, 4, 4, 5};
-    for (int acmod = 0; acmod < 16; ++acmod) {
-        int ac3 = -1, eac3 = -1, lfe = acmod / 8;
-        EXPECT_EQ(sys_get_ac3_channel_count(ac3_frame(acmod % 8, lfe).data(), 16, 0, &ac3) +
-                  sys_get_ac3_channel_count(eac3_frame(acmod % 8, lfe).data(), 13, 1, &eac3), 2);
-        EXPECT_EQ(ac3 * 10 + eac3, (full_range[acmod % 8] + lfe) * 11) << acmod;
-    }
-    int channels = -1;  // frame size codes past 37 are no header
-    const Bytes two = cat({ac3_frame(7, 1, 38, 0), ac3_frame(2, 0, 37)});
-    EXPECT_EQ(sys_get_ac3_channel_count(two.data(), int(two.size()), 0, &channels) * channels, 2);
-}
-
-}  // namespace

@@ -1,14 +1,9 @@
 // Codec identification and configuration from WAVEFORMATEX(TENSIBLE) and
 // BITMAPINFOHEADER read through the reader: what is kept, and short inputs.
-#include <memory>
 
 #include "asf_builder.h"
-#include "raw_input.h"
-#include "streaming.h"
 #include "sys_msft.h"
 #include "toolkit_fixture.h"
-
-namespace {
 
 using asfb::Bytes;
 
@@ -20,14 +15,12 @@ protected:
         close();
         input = host::RawInput::from_memory(bytes, {.disable_cache = true});
         ASSERT_EQ(OpenURL(&d.cbuffer, input->io(), 0, host.table()), 0);
-        s = {};
+        s = {}, s.config_len = config_len;
         s.config = config_len ? static_cast<uint8_t*>(sys_malloc(&d, config_len)) : nullptr;
-        s.config_len = config_len;
     }
     void close() {
         if (input) CloseURL(&d.cbuffer, &d.callback);
-        input.reset();
-        release(s.config);
+        input.reset(), release(s.config);
     }
     void TearDown() override { close(), HostedToolkit::TearDown(); }
     Bytes config() const { return Bytes(s.config, s.config + s.config_len); }
@@ -42,13 +35,11 @@ TEST_F(MsftParse, AudioConfigKeepsWholeHeaderOrOnlyCodecDataAndStopsAtShortInput
     wma2.extra = Bytes(10, 0xAB);
     aac.format_tag = 0x00FF, aac.block_align = 4, aac.extra = {0x12, 0x10};
     pcm.format_tag = 0x0001;
-    Bytes short_ext = asfb::waveformat_extensible(pcm, ac3_guid);
-    short_ext.resize(30);
+    const Bytes ext = asfb::waveformat_extensible(pcm, ac3_guid), short_ext(ext.begin(), ext.begin() + 30);
     const Bytes wma2_hdr = asfb::waveformatex(wma2), pcm_ext = asfb::waveformat_extensible(pcm, asfb::tag_subformat(1));
     const struct { Bytes wave; HOVAAudioType codec; Bytes config; uint32_t sample_size; } cases[] = {
-        {wma2_hdr, CLIP_AUDIO_TYPE_WMA2, wma2_hdr, 1485},
+        {wma2_hdr, CLIP_AUDIO_TYPE_WMA2, wma2_hdr, 1485}, {pcm_ext, CLIP_AUDIO_TYPE_LPCM, pcm_ext, 1485},
         {asfb::waveformatex(aac), CLIP_AUDIO_TYPE_AAC, {0x12, 0x10}, 0},  // block = frame size
-        {pcm_ext, CLIP_AUDIO_TYPE_LPCM, pcm_ext, 1485},
         {asfb::waveformat_extensible(pcm, eac3_guid, {1, 2, 3}), CLIP_AUDIO_TYPE_EAC3, {1, 2, 3}, 1485},
         {asfb::waveformat_extensible(pcm, asfb::tag_subformat(0xFF), {9}), CLIP_AUDIO_TYPE_AAC, {9}, 1485},
         {short_ext, CLIP_AUDIO_TYPE_UNKNOWN, {}, 1485}};
@@ -64,13 +55,14 @@ TEST_F(MsftParse, AudioConfigKeepsWholeHeaderOrOnlyCodecDataAndStopsAtShortInput
     uint32_t all = uint32_t(wma2_hdr.size());
     ASSERT_EQ(sys_msft_parse_audio_header(&d, &s, &all), HOVA_OK);
     EXPECT_EQ(std::make_pair(s.config_len, all), std::make_pair(0u, 12u));
-    load(wma2_hdr, 15);  // fewer than 16 bytes announced
-    uint32_t unread = 15;
-    EXPECT_EQ(sys_msft_parse_audio_header(&d, &s, &unread), HOVA_EndOfStream);
-    load(Bytes(wma2_hdr.begin(), wma2_hdr.begin() + 20), 28);  // the input ends in the extra bytes
-    unread = 28;
-    EXPECT_EQ(sys_msft_parse_audio_header(&d, &s, &unread), HOVA_EndOfStream);
-    EXPECT_EQ(std::make_pair(s.info.aud.sample_rate, unread), std::make_pair(44100u, 8u));
+    // Fewer than 16 bytes announced; the input ends in the extra bytes.
+    for (const auto& [w, n, left] : {std::tuple{wma2_hdr, 15u, 15u}, {Bytes(&wma2_hdr[0], &wma2_hdr[20]), 28u, 8u}}) {
+        load(w, n);
+        uint32_t unread = n;
+        const int r = sys_msft_parse_audio_header(&d, &s, &unread);
+        EXPECT_EQ(std::make_pair(r, unread), std::make_pair(int(HOVA_EndOfStream), left));
+    }
+    EXPECT_EQ(s.info.aud.sample_rate, 44100u);
 }
 
 TEST_F(MsftParse, VideoHeaderTakesLow16BitsAndPrivateData) {
@@ -87,9 +79,4 @@ TEST_F(MsftParse, VideoHeaderTakesLow16BitsAndPrivateData) {
                   std::make_tuple(CLIP_VIDEO_TYPE_WVC1, 0x31435657u, c.w, c.h, 0u,
                                   Bytes(c.priv.begin(), c.priv.begin() + c.kept)));
     }
-    load(Bytes(39, 0), 0);
-    uint32_t unread = 40, fourcc = 0;
-    EXPECT_EQ(sys_msft_parse_video_header(&d, &s, &unread, &fourcc), HOVA_EndOfStream);
 }
-
-}  // namespace

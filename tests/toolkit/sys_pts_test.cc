@@ -1,14 +1,8 @@
 // Timestamp gap repair and drop targets.
-#include <gtest/gtest.h>
-
 #include <cstring>
 
 #include "sys_pts.h"
-#include "test_env.h"
-#include "sys_demuxer.h"
-#include "streaming.h"
-
-namespace {
+#include "toolkit_fixture.h"
 
 constexpr hova_stream_type_et A = HOVA_STREAM_AUDIO, V = HOVA_STREAM_VIDEO;
 
@@ -62,5 +56,3 @@ TEST(DropTarget, OtherKindsDropUntilTheReaderReachesTheFirstTargetThenForgetIt) 
         EXPECT_EQ(sys_check_drop(&d, &audio), drop) << "reader at " << reader_at;
     }
 }
-
-}  // namespace

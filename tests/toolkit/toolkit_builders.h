@@ -38,10 +38,7 @@ inline Bytes cat(std::initializer_list<Bytes> parts) {
     for (const auto& p : parts) out.insert(out.end(), p.begin(), p.end());
     return out;
 }
-inline Bytes padded(Bytes b, size_t extra, uint8_t fill = 0) {
-    b.resize(b.size() + extra, fill);
-    return b;
-}
+inline Bytes padded(Bytes b, size_t extra, uint8_t fill = 0) { return b.resize(b.size() + extra, fill), b; }
 inline Bytes pattern(size_t n, uint8_t seed) {
     Bytes b(n);
     for (size_t i = 0; i < n; ++i) b[i] = static_cast<uint8_t>(seed + i * 7);
@@ -49,26 +46,20 @@ inline Bytes pattern(size_t n, uint8_t seed) {
 }
 
 // ---- AAC ----
-struct Asc {
-    int object_type = 2, sf_index = 4, channel_config = 2;
-};
+struct Asc { int object_type = 2, sf_index = 4, channel_config = 2; };
 // Object type, rate index, channel configuration, then 3 zero GASpecificConfig bits.
 inline Bytes asc_bytes(const Asc& a) {
     return BitWriter().put(a.object_type, 5).put(a.sf_index, 4).put(a.channel_config, 4).put(0, 3).bytes();
 }
 // One ADTS header (7 bytes, MPEG-4, no CRC, LC) followed by `payload` zero bytes.
 inline Bytes adts_frame(int sf_index, int channel_config, int payload = 0) {
-    BitWriter w;
-    w.put(0xFFF, 12).put(0, 3).put(1, 1).put(1, 2).put(sf_index, 4).put(0, 1).put(channel_config, 3);
-    w.put(0, 4).put(7 + payload, 13).put(0x7FF, 11).put(0, 2);
-    return padded(w.bytes(), static_cast<size_t>(payload));
+    auto w = BitWriter().put(0xFFF, 12).put(0, 3).put(1, 1).put(1, 2).put(sf_index, 4).put(0, 1);
+    return padded(w.put(channel_config, 3).put(0, 4).put(7 + payload, 13).put(0x7FF, 11).put(0, 2).bytes(), payload);
 }
 
-struct LoasLayer {
-    bool use_same_config = false;  // ignored for program 0 layer 0
-    Asc asc;
-    int asc_pad_bits = 0;          // zero bits behind the 13 ASC bits (its length, version 1)
-};
+// use_same_config is ignored for program 0 layer 0; asc_pad_bits: zero bits
+// behind the 13 ASC bits (their count is stored in version 1).
+struct LoasLayer { bool use_same_config = false; Asc asc; int asc_pad_bits = 0; };
 struct LoasConfig {
     bool use_same_stream_mux = false;
     int mux_version = 0;
@@ -114,9 +105,8 @@ inline Bytes ac3_frame(int acmod, int lfeon, int frmsizecod = 10, int pad = 8) {
     return padded(w.put(lfeon, 1).put(0x1F, 5).bytes(), static_cast<size_t>(pad));
 }
 inline Bytes eac3_frame(int acmod, int lfeon, int pad = 8) {
-    BitWriter w;
-    w.put(0x0B77, 16).put(0, 5).put(255, 11).put(0, 2).put(3, 2).put(acmod, 3).put(lfeon, 1);
-    return padded(w.put(16, 5).bytes(), static_cast<size_t>(pad));
+    auto w = BitWriter().put(0x0B77, 16).put(0, 5).put(255, 11).put(0, 2).put(3, 2).put(acmod, 3);
+    return padded(w.put(lfeon, 1).put(16, 5).bytes(), static_cast<size_t>(pad));
 }
 
 // ---- AVC ----
@@ -139,15 +129,10 @@ inline Bytes be(uint32_t v, int n, int bits = 8) {  // bits 7: syncsafe
 }
 inline Bytes text(const std::string& s) { return Bytes(s.begin(), s.end()); }
 
-struct Id3Frame {
-    std::string id;
-    Bytes body;
-    int64_t stored_size = -1;    // size field as stored (before encoding); -1: body.size()
-    bool plain_size_v4 = false;  // write a v2.4 size big-endian instead of syncsafe
-};
-inline Id3Frame text_frame(const std::string& id, uint8_t encoding, const Bytes& value) {
-    return {id, cat({{encoding}, value})};
-}
+// stored_size: the size field as stored (-1: body.size()); plain_size_v4: a
+// v2.4 size written big-endian instead of syncsafe.
+struct Id3Frame { std::string id; Bytes body; int64_t stored_size = -1; bool plain_size_v4 = false; };
+inline Id3Frame text_frame(const std::string& id, uint8_t enc, const Bytes& v) { return {id, cat({{enc}, v})}; }
 // The frames of a tag as stored for `version` (2, 3 or 4).
 inline Bytes id3_frames(int version, const std::vector<Id3Frame>& frames) {
     Bytes out;

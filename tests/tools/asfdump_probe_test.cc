@@ -4,21 +4,10 @@
 
 #include "test_env.h"
 
-namespace {
-
 using namespace std::string_literals;
 
 int asfdump(const std::string& args, std::string* out) {
     return testenv::run_command(testenv::asfdump_path() + " " + args + " 2>/dev/null", out);
-}
-
-TEST(AsfdumpProbe, EveryCorpusFileProbesOne) {
-    const auto files = testenv::corpus_files();
-    if (files.empty()) GTEST_SKIP() << "no corpus in " << testenv::corpus_dir();
-    for (const std::string& f : files) {
-        std::string out;
-        EXPECT_EQ(std::make_pair(asfdump("probe '" + f + "'", &out), out), std::make_pair(0, "1\n"s)) << f;
-    }
 }
 
 TEST(AsfdumpProbe, ExitStatusFollowsTheContract) {
@@ -33,6 +22,7 @@ TEST(AsfdumpProbe, ExitStatusFollowsTheContract) {
         EXPECT_EQ(asfdump(args, &out), status) << args;
         if (status == 0) { EXPECT_EQ(out.rfind("usage: asfdump probe FILE\n", 0), 0u) << args; }
     }
+    std::string out;
+    for (const std::string& f : testenv::corpus_files())  // a real file answers 1
+        EXPECT_EQ(std::make_pair(asfdump("probe '" + f + "'", &out), out), std::make_pair(0, "1\n"s)) << f;
 }
-
-}  // namespace
