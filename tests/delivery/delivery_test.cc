@@ -177,6 +177,13 @@ std::vector<Shape> shapes() {
                  av_file({one(media(1, 1, 0, 10, 0, pattern(10, 9)), 1024),
                           asfb::misaligned_packet(junk, {part(0, 450), part(450, 900)}, 1024), tail}),
                  {{2, 0, v1}, {2, 40000, v2}}, 0, 1});
+    // A packet that lost the end of its padding: the next starts early, and the
+    // scan takes its start, not the bytes behind its error correction flags.
+    for (bool multiple : {true, false}) {
+        auto short_one = mux(objs, 700, {true, multiple, 0, 0, 2, 1, 3, 1, 2, {}, {}, {}}, 1, 600);
+        short_one[5].resize(700 - 7);
+        s.push_back({"packet short of its padding", av_file(short_one, 700), all_but_last(objs)});
+    }
     Bytes zeros(1024, 0);
     zeros[0] = 0x91;  // error correction in an unusual form; nothing plausible after it
     const auto half = [&](uint32_t num, uint32_t ms, const Bytes& x) { return one(media(1, num, 0, 50, ms, cut(x, 0, 50)), 1024); };
