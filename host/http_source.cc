@@ -40,8 +40,8 @@ uint64_t parse_u64(const char* p, const char** end) {
 
 // One easy handle driven through a multi handle: reads pump it until the
 // bytes they want have arrived, and the write callback pauses the transfer
-// when the window ahead of the reader is full, so nothing arrives that the
-// reader has not come close to asking for.
+// once they have, so nothing is received past the read in progress but the
+// rest of one receive.
 struct HttpSource::Impl {
     std::string url;
     HttpOptions opt;
@@ -63,7 +63,9 @@ struct HttpSource::Impl {
     // Body bytes of the open transfer: buf[0] is the file's byte at buf_pos.
     std::vector<uint8_t> buf;
     uint64_t buf_pos = 0;
-    uint64_t reader = 0;  // where the last read ended (the window counts from here)
+    uint64_t reader = 0;     // where the last read ended
+    uint64_t want_end = 0;   // end of the read in progress: the transfer pauses there
+    size_t refused = 0;      // bytes of a receive handed back with a pause (libcurl keeps them)
 
     bool ranges = false;
     uint64_t size = UINT64_MAX;
@@ -82,7 +84,7 @@ struct HttpSource::Impl {
     }
 
     uint64_t buf_end() const { return buf_pos + buf.size(); }
-    size_t ahead() const { return buf_end() > reader ? static_cast<size_t>(buf_end() - reader) : 0; }
+    bool wanted() const { return buf_end() < want_end; }
 
     static size_t on_header(char* p, size_t sz, size_t n, void* ud) {
         auto* s = static_cast<Impl*>(ud);
@@ -126,12 +128,14 @@ struct HttpSource::Impl {
     static size_t on_body(char* p, size_t sz, size_t n, void* ud) {
         auto* s = static_cast<Impl*>(ud);
         const size_t len = sz * n;
-        // A full window holds the transfer; curl hands the same bytes again
-        // when it is resumed.
-        if (s->ahead() >= s->opt.window) {
+        // The read in progress has its bytes: hold the transfer. curl keeps
+        // this receive and hands it again when the transfer is resumed.
+        if (!s->wanted()) {
             s->paused = true;
+            s->refused = len;
             return CURL_WRITEFUNC_PAUSE;
         }
+        s->refused = 0;
         s->buf.insert(s->buf.end(), p, p + len);
         s->stats.bytes_received += len;
         return len;
@@ -162,6 +166,7 @@ struct HttpSource::Impl {
         curl_easy_setopt(easy, CURLOPT_WRITEDATA, this);
         curl_easy_setopt(easy, CURLOPT_SOCKOPTFUNCTION, &Impl::on_socket);
         curl_easy_setopt(easy, CURLOPT_SOCKOPTDATA, this);
+        curl_easy_setopt(easy, CURLOPT_BUFFERSIZE, opt.receive_chunk);
         return true;
     }
 
@@ -173,8 +178,7 @@ struct HttpSource::Impl {
         if (std::getenv("PLIMO_HTTP_TRACE"))
             std::fprintf(stderr, "http: request from byte %llu (held %llu-%llu)\n", static_cast<unsigned long long>(pos),
                          static_cast<unsigned long long>(buf_pos), static_cast<unsigned long long>(buf_end()));
-        if (attached) curl_multi_remove_handle(multi, easy);
-        attached = false;
+        drop_transfer();
         paused = false;
         done = false;
         result = CURLE_OK;
@@ -202,7 +206,7 @@ struct HttpSource::Impl {
     // when the transfer has ended.
     bool pump(int wait_ms) {
         if (!attached || done) return false;
-        if (paused && ahead() < opt.window) {
+        if (paused && wanted()) {
             paused = false;
             curl_easy_pause(easy, CURLPAUSE_CONT);
         }
@@ -250,11 +254,19 @@ struct HttpSource::Impl {
         return "";
     }
 
+    // What curl still kept of a refused receive came over the network all
+    // the same: it counts when the transfer goes.
+    void drop_transfer() {
+        if (attached) curl_multi_remove_handle(multi, easy);
+        attached = false;
+        stats.bytes_received += refused;
+        refused = 0;
+    }
+
     void fail(const std::string& why) {
         if (failure.empty()) failure = why;
         broken = why;
-        if (attached) curl_multi_remove_handle(multi, easy);
-        attached = false;
+        drop_transfer();
         done = true;
     }
 
@@ -305,6 +317,7 @@ struct HttpSource::Impl {
 
     size_t read(uint64_t pos, uint8_t* dst, size_t len) {
         size_t got = 0;
+        want_end = pos + len;
         while (got < len) {
             const uint64_t p = pos + got;
             if (p >= size) break;
@@ -384,7 +397,11 @@ bool HttpSource::reachable(uint64_t pos) const {
 size_t HttpSource::read(uint64_t pos, void* dst, size_t len) {
     return impl_->read(pos, static_cast<uint8_t*>(dst), len);
 }
-const HttpStats& HttpSource::stats() const { return impl_->stats; }
+HttpStats HttpSource::stats() const {
+    HttpStats s = impl_->stats;
+    s.bytes_received += impl_->refused;
+    return s;
+}
 const std::string& HttpSource::failure() const { return impl_->failure; }
 
 #else  // no libcurl
@@ -405,7 +422,7 @@ bool HttpSource::ranges() const { return false; }
 uint64_t HttpSource::size() const { return 0; }
 bool HttpSource::reachable(uint64_t) const { return false; }
 size_t HttpSource::read(uint64_t, void*, size_t) { return 0; }
-const HttpStats& HttpSource::stats() const { return impl_->stats; }
+HttpStats HttpSource::stats() const { return impl_->stats; }
 const std::string& HttpSource::failure() const { return impl_->failure; }
 
 #endif

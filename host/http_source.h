@@ -20,8 +20,11 @@ struct HttpOptions {
     // Bytes kept behind the reader, so that a peek followed by a seek back
     // (what an unbuffered reader does) does not cost a request.
     size_t history = 64 * 1024;
-    // The transfer pauses when this many bytes wait ahead of the reader.
-    size_t window = 16 * 1024;
+    // What one receive takes from the socket (libcurl's buffer). The
+    // transfer pauses as soon as the read in progress has its bytes, so this
+    // bounds what a read receives past its end, and what a seek that drops
+    // the transfer throws away.
+    long receive_chunk = 4 * 1024;
     // Receive buffer asked of the kernel (it doubles it): bounds what the
     // server has sent into the socket and a dropped transfer throws away.
     int socket_buffer = 64 * 1024;
@@ -33,7 +36,9 @@ struct HttpOptions {
 
 struct HttpStats {
     uint64_t requests = 0;
-    uint64_t bytes_received = 0;  // body bytes that reached us, all requests
+    // Body bytes that reached us, all requests: those handed to the reader
+    // and those received but dropped with their transfer.
+    uint64_t bytes_received = 0;
     uint64_t wait_us = 0;         // time blocked in reads waiting for the server
 };
 
@@ -60,7 +65,8 @@ public:
     // the transfer failed (then failure() says why).
     size_t read(uint64_t pos, void* dst, size_t len);
 
-    const HttpStats& stats() const;
+    // Counts so far; a receive the open transfer holds back counts as received.
+    HttpStats stats() const;
     // Empty while nothing went wrong; "connection cut ..." and the like after.
     const std::string& failure() const;
 

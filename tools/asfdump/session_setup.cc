@@ -28,7 +28,7 @@ std::unique_ptr<host::RawInput> make_input(const Options& opts) {
 bool report_network(const host::RawInput& input, const Options& opts) {
     const host::HttpSource* http = input.http();
     if (!http) return true;
-    const host::HttpStats& s = http->stats();
+    const host::HttpStats s = http->stats();
     std::fprintf(stderr, "asfdump: http: %" PRIu64 " requests, %" PRIu64 " bytes received, %.1f ms waiting\n",
                  s.requests, s.bytes_received, static_cast<double>(s.wait_us) / 1000.0);
     if (http->failure().empty()) return true;
