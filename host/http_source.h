@@ -16,7 +16,7 @@ namespace host {
 struct HttpOptions {
     // A read at most this far past what the transfer has delivered reads
     // through instead of starting a request (see docs/decisions.md).
-    size_t read_through = 32 * 1024;
+    size_t read_through = 64 * 1024;
     // Bytes kept behind the reader, so that a peek followed by a seek back
     // (what an unbuffered reader does) does not cost a request.
     size_t history = 64 * 1024;
