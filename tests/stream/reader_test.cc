@@ -103,6 +103,27 @@ TEST(ReaderEquivalence, ThreadMovesNeverLetStaleOrMissingBytesThrough) {
     EXPECT_GT(r.in->counters().seeks, 1000u) << "the moves left the buffered bytes";
 }
 
+TEST(ReaderRing, SeekBackIntoAVisitedBlockReadsNothingAgain) {
+    // A far seek reads one block aside and the ring goes on from its end; a
+    // second seek to the same place (a seek answered twice) is served from
+    // that block and then from the ring's history, without moving the input.
+    for (Mode mode : {Mode::SyncRing, Mode::Thread}) {
+        SCOPED_TRACE(int(mode));
+        Reader r(pattern(1 << 20, 3), mode, 4096, 65536);
+        ASSERT_EQ(r.open(), 0);
+        ASSERT_EQ(r.take(100), r.slice(0, 100));
+        const cb_off_t far = 500000;
+        for (int pass = 0; pass < 2; ++pass) {
+            const uint64_t seeks = r.in->counters().seeks;
+            ASSERT_EQ(r.seek(far, CB_SEEK_SET), far);
+            ASSERT_EQ(r.take(20000), r.slice(far, 20000));
+            if (pass == 1) {
+                EXPECT_EQ(r.in->counters().seeks, seeks) << "input moved again";
+            }
+        }
+    }
+}
+
 TEST(ReaderClose, EndsTheThreadWaitingForRoomOrStalledInARead) {
     for (bool stall : {false, true}) {
         Reader r(pattern(100000), Mode::Thread, 64, stall ? 4096 : 256);

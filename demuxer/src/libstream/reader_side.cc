@@ -73,12 +73,27 @@ cb_off_t fetch_side(cb_buffer_st* cb, cb_fpos target) {
     return static_cast<cb_off_t>(target);
 }
 
+// The ring's history still holds `end`, behind where the ring stands (a
+// seek back into the block of an earlier visit whose bytes after it were
+// read since): the ring goes back there, nothing is read again.
+bool rewind_to_side_end(cb_buffer_st* cb, cb_fpos end) {
+    const ring_side_st* s = ring_side(cb);
+    if (end >= s->ring_pos) return false;
+    sys_ringbuffer_settle(cb->active_rbuf);
+    const cb_fpos was = cb->curpos;
+    cb->curpos = s->ring_pos;
+    if (rewind_ring(cb, static_cast<cb_off_t>(end))) return true;
+    cb->curpos = was;
+    return false;
+}
+
 // At the side block's end: back to the ring, which moves there unless it
-// already starts there. False when the input refuses the move.
+// already starts there or keeps the bytes from there. False when the input
+// refuses the move.
 bool leave_side_at_end(cb_buffer_st* cb) {
     ring_side_st* s = ring_side(cb);
     const cb_fpos end = side_end(s);
-    if (s->ring_pos != end) {
+    if (s->ring_pos != end && !rewind_to_side_end(cb, end)) {
         const cb_off_t r = reposition_ring_input(cb, static_cast<cb_off_t>(end), CB_SEEK_SET);
         if (r == -1) return false;
     }
