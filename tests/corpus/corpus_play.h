@@ -47,7 +47,7 @@ struct Player {
             step();
         return last;
     }
-    int seek(int dir, int64_t* t) { return hova_asff_demuxer.seek_time(s.context(), dir, t, 0); }
+    int seek(int dir, int64_t* t, int query = 0) { return hova_asff_demuxer.seek_time(s.context(), dir, t, query); }
     // Every event as a line, then the last result and the number of calls.
     std::vector<std::string> trace() {
         std::vector<std::string> out;

@@ -266,8 +266,8 @@ TEST(CorpusInfo, AgreesWithFfprobe) {
 // delivery has gone into separate parsing (the files that interleave audio and
 // video far apart) or to the end of the stream. A backward seek lands
 // on the last key frame at or before the target (time 0 when there is none), a
-// forward seek on a key frame at or after it whenever one exists, else it
-// fails. Delivery then hands over that key frame byte for byte among its first
+// forward seek on a key frame at or after it whenever one exists (and no
+// key frame a backward seek finds lies between the two), else it fails. Delivery then hands over that key frame byte for byte among its first
 // frames, every frame of the kind has a reference time, and in separate
 // parsing the other stream resumes too.
 TEST(CorpusSeek, SweepLandsOnTheAskedSideAndDeliversTheKeyFrame) {
@@ -314,6 +314,12 @@ TEST(CorpusSeek, SweepLandsOnTheAskedSideAndDeliversTheKeyFrame) {
                         const size_t from = p.cb().events().size();
                         int64_t found = target;
                         const int rc = p.seek(dir, &found);
+                        if (rc == HOVA_OK && dir == HOVA_SEEK_FORWARD) {
+                            // No key frame the seek can find lies between the target and the answer.
+                            int64_t before = found - 1;
+                            ASSERT_EQ(p.seek(HOVA_SEEK_BACKWARD, &before, 1), HOVA_OK);
+                            EXPECT_LE(before, target) << "forward answer " << found;
+                        }
                         std::vector<HostEvent> got;
                         int at = -1;  // frames of the kind delivered before the one found
                         for (int calls = 0; rc == HOVA_OK && calls < 100000 && at < 0 && got.size() <= 120; ++calls) {

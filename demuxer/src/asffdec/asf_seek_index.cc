@@ -87,6 +87,17 @@ int64_t entry_time(asf_demuxer_st* d, uint32_t i, uint32_t packet) {
     return read_next_entry(d, i, e);
 }
 
+// Moves *at to the nearest entry before (or after) it that names another
+// packet than `packet`; false at the end of the index or on a failed read.
+[[nodiscard]] bool neighbour_entry(asf_demuxer_st* d, bool before, uint32_t* at, uint32_t packet, IndexEntry* e) {
+    do {
+        if (before ? *at == 0 : *at + 1 >= d->index_count) return false;
+        *at = before ? *at - 1 : *at + 1;
+        if (!read_entry_at(d, *at, e)) return false;
+    } while (e->packet_number == packet);
+    return true;
+}
+
 // Entry 0 may stand for a time other than 0 (the first key frame rarely sits
 // at 0): the first entry naming another packet than entry 0 is probed and the
 // offset worked back from its time. False on a failed read of the index.
@@ -218,16 +229,26 @@ uint64_t asf_find_packet_by_index(asf_demuxer_st* d, int dir, int64_t* pts) {
     // entry's packet, which need not be that entry's own time: the walk may
     // end an entry off. Step entry by entry (over entries repeating the
     // packet) until the key frame lies on the asked side of the target.
+    bool stepped = false;
     while (back ? t > target : t < target) {
         IndexEntry e;
-        do {
-            if (back ? at == 0 : at + 1 >= d->index_count) return kAsfNoPacket;
-            at = back ? at - 1 : at + 1;
-            if (!read_entry_at(d, at, &e)) return kAsfNoPacket;
-        } while (e.packet_number == packet);
+        if (!neighbour_entry(d, back, &at, packet, &e)) return kAsfNoPacket;
         packet = e.packet_number;
         t = entry_time(d, at, packet);
         if (t == -1) return kAsfNoPacket;
+        stepped = true;
+    }
+    // Going forward, the entries before the answer may name key frames after
+    // the target too (the walk started an entry late): the first key frame
+    // after the target is the answer.
+    for (uint32_t j = at; !back && !stepped;) {
+        IndexEntry e;
+        if (!neighbour_entry(d, true, &j, packet, &e)) break;
+        const int64_t tj = entry_time(d, j, e.packet_number);
+        if (tj == -1 || tj <= target) break;
+        at = j;
+        packet = e.packet_number;
+        t = tj;
     }
     *pts = t;
     return packet;
