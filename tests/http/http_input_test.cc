@@ -146,6 +146,23 @@ TEST(HttpInput, SeekOverKnownIndexEntriesCostsOneRequestInEveryMode) {
     }
 }
 
+// The input alone: the file's bytes in one request, and a read at the end
+// answers nothing without asking the server.
+TEST(HttpInput, ReadsTheFileInOneRequestAndNothingPastItsEnd) {
+    REQUIRE_WEB_SERVER(server);
+    REQUIRE_CORPUS_FILE(path, "moon-timecode-short.wmv");
+    std::string why;
+    auto src = HttpSource::open(server->url(base_name(path)), &why);
+    ASSERT_TRUE(src) << why;
+    const std::vector<uint8_t> file = testenv::read_file_or_empty(path);
+    std::vector<uint8_t> got(file.size() + 1);
+    EXPECT_EQ(src->read(0, got.data(), got.size()), file.size());
+    EXPECT_TRUE(std::equal(file.begin(), file.end(), got.begin()));
+    EXPECT_EQ(src->read(file.size(), got.data(), 1), 0u);
+    EXPECT_EQ(src->stats().requests, 1u);
+    EXPECT_EQ(src->failure(), "");
+}
+
 // Answers one request on loopback like a server without ranges, but sends
 // only the first half of the file before it closes the connection.
 struct CuttingServer {
