@@ -73,16 +73,13 @@ cb_off_t fetch_side(cb_buffer_st* cb, cb_fpos target) {
     return static_cast<cb_off_t>(target);
 }
 
-// The ring's history still holds `end`, behind where the ring stands (a
-// seek back into the block of an earlier visit whose bytes after it were
-// read since): the ring goes back there, nothing is read again.
-bool rewind_to_side_end(cb_buffer_st* cb, cb_fpos end) {
-    const ring_side_st* s = ring_side(cb);
-    if (end >= s->ring_pos) return false;
-    sys_ringbuffer_settle(cb->active_rbuf);
+// The ring, whose read position is `from`, goes back to `target` when its
+// history still holds the bytes from there (curpos is `target` then);
+// nothing changes otherwise.
+bool rewind_ring_from(cb_buffer_st* cb, cb_fpos from, cb_fpos target) {
     const cb_fpos was = cb->curpos;
-    cb->curpos = s->ring_pos;
-    if (rewind_ring(cb, static_cast<cb_off_t>(end))) return true;
+    cb->curpos = from;
+    if (rewind_ring(cb, static_cast<cb_off_t>(target))) return true;
     cb->curpos = was;
     return false;
 }
@@ -93,9 +90,13 @@ bool rewind_to_side_end(cb_buffer_st* cb, cb_fpos end) {
 bool leave_side_at_end(cb_buffer_st* cb) {
     ring_side_st* s = ring_side(cb);
     const cb_fpos end = side_end(s);
-    if (s->ring_pos != end && !rewind_to_side_end(cb, end)) {
-        const cb_off_t r = reposition_ring_input(cb, static_cast<cb_off_t>(end), CB_SEEK_SET);
-        if (r == -1) return false;
+    if (s->ring_pos != end) {
+        // A seek back into the block of an earlier visit, after the ring read
+        // on past it, finds the bytes from its end in the ring's history.
+        sys_ringbuffer_settle(cb->active_rbuf);
+        if (!rewind_ring_from(cb, s->ring_pos, end) &&
+            reposition_ring_input(cb, static_cast<cb_off_t>(end), CB_SEEK_SET) == -1)
+            return false;
     }
     s->active = 0;
     end_hold(cb);
@@ -227,15 +228,10 @@ cb_off_t ring_seek_to(cb_buffer_st* cb, cb_off_t target) {
         if (cb->curpos == t) return target;
         // The input ended first: a visit past its end, as for any far target.
     }
-    if (t < rp) {
-        const cb_fpos was = cb->curpos;
-        cb->curpos = rp;
-        if (rewind_ring(cb, target)) {
-            s->active = 0;
-            end_hold(cb);
-            return target;
-        }
-        cb->curpos = was;
+    if (t < rp && rewind_ring_from(cb, rp, t)) {
+        s->active = 0;
+        end_hold(cb);
+        return target;
     }
     return fetch_side(cb, t);
 }
