@@ -108,8 +108,10 @@ bool VideoDecoder::send(const uint8_t* bytes, size_t size, int64_t pts) {
     AVPacket* p = impl_->packet;
     if (av_new_packet(p, static_cast<int>(size)) < 0) return false;
     std::memcpy(p->data, bytes, size);
-    p->pts = pts;
-    p->dts = AV_NOPTS_VALUE;
+    // The frame's time stands as its decoding time: with reordering, a
+    // picture is timed by the frame that brings it out, as ffmpeg times it.
+    p->pts = AV_NOPTS_VALUE;
+    p->dts = pts;
     const int rc = avcodec_send_packet(impl_->ctx, p);
     av_packet_unref(p);
     return rc >= 0;
@@ -120,7 +122,7 @@ void VideoDecoder::send_end() { avcodec_send_packet(impl_->ctx, nullptr); }
 bool VideoDecoder::receive(int64_t* pts, bool* key) {
     if (avcodec_receive_frame(impl_->ctx, impl_->frame) < 0) return false;
     const AVFrame* f = impl_->frame;
-    *pts = f->pts != AV_NOPTS_VALUE ? f->pts : f->best_effort_timestamp;
+    *pts = f->best_effort_timestamp;
     *key = f->key_frame != 0 || f->pict_type == AV_PICTURE_TYPE_I;
     return true;
 }
@@ -138,12 +140,26 @@ Image VideoDecoder::rgb(int width) const {
     // picture converts as `ffmpeg -frames:v 1 out.png` converts it.
     SwsContext* sws = sws_getContext(f->width, f->height, static_cast<AVPixelFormat>(f->format), out.width,
                                      out.height, AV_PIX_FMT_RGB24, SWS_BICUBIC, nullptr, nullptr, nullptr);
-    if (!sws) return Image{};
-    out.rgb.resize(static_cast<size_t>(out.width) * out.height * 3);
-    uint8_t* dst[4] = {out.rgb.data(), nullptr, nullptr, nullptr};
-    int stride[4] = {out.width * 3, 0, 0, 0};
-    sws_scale(sws, f->data, f->linesize, 0, f->height, dst, stride);
+    // swscale's vector code writes whole blocks past a row's end: it scales
+    // into a padded frame, whose rows are then copied out.
+    AVFrame* dst = av_frame_alloc();
+    bool ok = sws && dst;
+    if (ok) {
+        dst->format = AV_PIX_FMT_RGB24;
+        dst->width = out.width;
+        dst->height = out.height;
+        ok = av_frame_get_buffer(dst, 0) >= 0 &&
+             sws_scale(sws, f->data, f->linesize, 0, f->height, dst->data, dst->linesize) == out.height;
+    }
+    if (ok) {
+        out.rgb.resize(static_cast<size_t>(out.width) * out.height * 3);
+        for (int y = 0; y < out.height; ++y)
+            std::memcpy(out.pixel(0, y), dst->data[0] + static_cast<ptrdiff_t>(y) * dst->linesize[0],
+                        static_cast<size_t>(out.width) * 3);
+    }
+    av_frame_free(&dst);
     sws_freeContext(sws);
+    if (!ok) return Image{};
     return out;
 }
 

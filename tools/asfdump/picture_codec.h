@@ -29,7 +29,9 @@ public:
     // No more frames: the pictures the decoder still holds come out.
     void send_end();
     // The next decoded picture, in display order; false when none is ready.
-    // Its time is the time of the frame that carried it.
+    // Its time is that of the frame whose decoding brought it out (the
+    // frame's own time unless the decoder holds pictures back for
+    // reordering); AV_NOPTS_VALUE (INT64_MIN) for pictures drained at the end.
     bool receive(int64_t* pts, bool* key);
     // Back to the state after create (after send_end, to decode again).
     void reset();

@@ -196,11 +196,16 @@ int thumb_at(const hova_dmx_func_st* dmx, const Options& opts, const Request& r)
     // passed over, as are pictures before the target.
     std::unique_ptr<VideoDecoder> decoder;
     bool key_seen = false, got = false, ended = false;
-    int64_t got_pts = -1;
+    int64_t got_pts = -1, last_pts = INT64_MIN, last_step = 1;
     auto take = [&] {
         int64_t pts = 0;
         bool key = false;
         while (!got && decoder->receive(&pts, &key)) {
+            // Pictures drained at the end have no time: they follow the last
+            // one at the same pace.
+            if (pts == INT64_MIN && last_pts != INT64_MIN) pts = last_pts + last_step;
+            if (pts != INT64_MIN && last_pts != INT64_MIN && pts > last_pts) last_step = pts - last_pts;
+            last_pts = pts;
             key_seen = key_seen || key;
             if (key_seen && pts >= r.at_us) {
                 got = true;
