@@ -97,7 +97,7 @@ bool merged_before(const json& ffprobe, const std::vector<int64_t>& delivered, i
     return got < in_file;
 }
 
-TEST(AsfdumpThumb, PicturesAreFfmpegsNearTheStartMiddleAndEndOfEveryVideoFile) {
+TEST(AsfdumpThumb, PicturesAreFfmpegsFromStartToEndOfEveryVideoFile) {
     REQUIRE_PICTURES();
     int checked = 0;
     for (const std::string& file : testenv::corpus_files()) {
@@ -118,10 +118,20 @@ TEST(AsfdumpThumb, PicturesAreFfmpegsNearTheStartMiddleAndEndOfEveryVideoFile) {
             continue;
         }
         const json ffprobe = json::parse(std::ifstream(file + ".ffprobe.json"));
-        for (const int64_t t : {times.front(), times[times.size() / 2], times.back()}) {
+        // Half a frame past the last delivered frame: the VC-1 decoder holds
+        // its last picture back until the end, then it still has one; other
+        // decoders have none left (the file's last frame stays pending).
+        const int64_t past = times.size() < 2 ? times.back() + 1 : times.back() + (times.back() - times.end()[-2]) / 2;
+        const std::string codec = info["active_video"]["codec_name"];
+        const bool held_back = codec == "WVC1" || codec == "WMVA";
+        for (const int64_t t : {times.front(), times[times.size() / 2], times.back(), past}) {
             const std::string where = file + " at " + std::to_string(t) + " us";
-            ASSERT_EQ(asfdump("thumb " + quote(file) + " --at " + std::to_string(t) + " -o " + png, &out), 0)
-                << where << ": " << out;
+            const int rc = asfdump("thumb " + quote(file) + " --at " + std::to_string(t) + " -o " + png, &out);
+            if (t == past && !held_back) {
+                EXPECT_EQ(rc, 1) << where << ": " << out;
+                continue;
+            }
+            ASSERT_EQ(rc, 0) << where << ": " << out;
             EXPECT_EQ(png_size(png), std::make_pair(info["active_video"]["width"].get<int>(),
                                                     info["active_video"]["height"].get<int>())) << where;
             // -seek_timestamp: ffmpeg's -ss in the stream's own times (not past its start time).

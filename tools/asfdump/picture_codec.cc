@@ -172,21 +172,20 @@ bool write_png(const Image& image, const std::string& path, std::string* error) 
     AVCodecContext* ctx = avcodec_alloc_context3(codec);
     AVFrame* frame = av_frame_alloc();
     AVPacket* packet = av_packet_alloc();
-    bool ok = false;
-    if (ctx && frame && packet) {
-        ctx->width = image.width;
-        ctx->height = image.height;
+    bool ok = ctx && frame && packet;
+    if (ok) {
+        ctx->width = frame->width = image.width;
+        ctx->height = frame->height = image.height;
         ctx->pix_fmt = AV_PIX_FMT_RGB24;
-        ctx->time_base = AVRational{1, 1};
         frame->format = AV_PIX_FMT_RGB24;
-        frame->width = image.width;
-        frame->height = image.height;
-        if (avcodec_open2(ctx, codec, nullptr) >= 0 && av_frame_get_buffer(frame, 0) >= 0) {
-            for (int y = 0; y < image.height; ++y)
-                std::memcpy(frame->data[0] + static_cast<ptrdiff_t>(y) * frame->linesize[0], image.pixel(0, y),
-                            static_cast<size_t>(image.width) * 3);
-            ok = avcodec_send_frame(ctx, frame) >= 0 && avcodec_receive_packet(ctx, packet) >= 0;
-        }
+        ctx->time_base = AVRational{1, 1};
+        ok = avcodec_open2(ctx, codec, nullptr) >= 0 && av_frame_get_buffer(frame, 0) >= 0;
+    }
+    if (ok) {
+        for (int y = 0; y < image.height; ++y)
+            std::memcpy(frame->data[0] + static_cast<ptrdiff_t>(y) * frame->linesize[0], image.pixel(0, y),
+                        static_cast<size_t>(image.width) * 3);
+        ok = avcodec_send_frame(ctx, frame) >= 0 && avcodec_receive_packet(ctx, packet) >= 0;
     }
     if (!ok) {
         *error = "the PNG encoder failed";
