@@ -12,6 +12,7 @@ namespace asfdump {
 int run_probe(const hova_dmx_func_st* dmx, const Options& opts);
 int run_info(const hova_dmx_func_st* dmx, const Options& opts);
 int run_frames(const hova_dmx_func_st* dmx, const Options& opts);
+int run_thumb(const hova_dmx_func_st* dmx, const Options& opts);
 
 // The session over the file with the input the options describe; null, said
 // on stderr, when the file cannot be read.

@@ -64,6 +64,7 @@ int main(int argc, char** argv) {
     if (opts.command == "probe") return asfdump::run_probe(dmx, opts);
     if (opts.command == "info") return asfdump::run_info(dmx, opts);
     if (opts.command == "frames") return asfdump::run_frames(dmx, opts);
+    if (opts.command == "thumb") return asfdump::run_thumb(dmx, opts);
     std::fprintf(stderr, "asfdump: %s is not available yet\n", opts.command.c_str());
     return asfdump::kExitUsage;
 }

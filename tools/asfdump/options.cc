@@ -13,7 +13,7 @@ namespace {
 enum OptId {
     kBuffer = 256, kThread, kBlockSize, kRingSize, kStreaming, kNotSeekable, kDetectDisc,
     kSeek, kBackward, kQuery, kResync, kThumbnail, kNoAudio, kNoVideo, kMaxFrames, kDumpStreams,
-    kLog, kPlugin, kHelp,
+    kLog, kPlugin, kHelp, kThumbAt, kThumbWidth, kThumbEvery, kThumbSheet, kThumbColumns,
 };
 
 const option kLongOptions[] = {
@@ -36,6 +36,11 @@ const option kLongOptions[] = {
     {"log", no_argument, nullptr, kLog},
     {"plugin", required_argument, nullptr, kPlugin},
     {"help", no_argument, nullptr, kHelp},
+    {"at", required_argument, nullptr, kThumbAt},
+    {"width", required_argument, nullptr, kThumbWidth},
+    {"every", required_argument, nullptr, kThumbEvery},
+    {"sheet", required_argument, nullptr, kThumbSheet},
+    {"columns", required_argument, nullptr, kThumbColumns},
     {nullptr, 0, nullptr, 0},
 };
 
@@ -55,6 +60,8 @@ const char* usage_text() {
     return "usage: asfdump probe FILE\n"
            "       asfdump info FILE [input options]\n"
            "       asfdump frames FILE [input options] [play options]\n"
+           "       asfdump thumb FILE --at TIME -o OUT.png [--width N]\n"
+           "       asfdump thumb FILE --every DURATION --sheet OUT.png [--columns N] [--width N]\n"
            "       asfdump --help\n"
            "FILE may be an http:// URL (default buffering then: --buffer ring --thread)\n"
            "input options: --buffer cache|none|ring, --thread, --block-size N, --ring-size N,\n"
@@ -71,7 +78,7 @@ bool parse_options(int argc, char** argv, Options* o, std::string* error) {
     std::string buffer = "cache";
     int c;
     int64_t v = 0;
-    while ((c = getopt_long(argc, argv, "h", kLongOptions, nullptr)) != -1) {
+    while ((c = getopt_long(argc, argv, "ho:", kLongOptions, nullptr)) != -1) {
         switch (c) {
             case kBuffer:
                 buffer = optarg;
@@ -115,6 +122,12 @@ bool parse_options(int argc, char** argv, Options* o, std::string* error) {
             case kDumpStreams: o->dump_dir = optarg; break;
             case kLog: o->log = true; break;
             case kPlugin: o->plugin = optarg; break;
+            case kThumbAt: o->thumb.at = optarg; break;
+            case 'o': o->thumb.output = optarg; break;
+            case kThumbWidth: o->thumb.width = optarg; break;
+            case kThumbEvery: o->thumb.every = optarg; break;
+            case kThumbSheet: o->thumb.sheet = optarg; break;
+            case kThumbColumns: o->thumb.columns = optarg; break;
             case kHelp:
             case 'h':
                 o->help = true;
@@ -131,7 +144,8 @@ bool parse_options(int argc, char** argv, Options* o, std::string* error) {
     }
     o->command = argv[optind];
     o->file = argv[optind + 1];
-    if (o->command != "probe" && o->command != "info" && o->command != "frames") {
+    if (o->command != "probe" && o->command != "info" && o->command != "frames" &&
+        o->command != "thumb") {
         *error = "unknown command " + o->command;
         return false;
     }

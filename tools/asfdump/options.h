@@ -8,6 +8,16 @@
 
 namespace asfdump {
 
+// thumb's options as given; thumb_cmd.cc reads and checks them.
+struct ThumbArgs {
+    const char* at = nullptr;       // --at TIME
+    const char* output = nullptr;   // -o OUT.png
+    const char* width = nullptr;    // --width N
+    const char* every = nullptr;    // --every DURATION
+    const char* sheet = nullptr;    // --sheet OUT.png
+    const char* columns = nullptr;  // --columns N
+};
+
 struct Options {
     std::string command;
     std::string file;
@@ -30,6 +40,7 @@ struct Options {
     int64_t max_frames = -1;
     std::string dump_dir;
     bool log = false;
+    ThumbArgs thumb;  // thumb's own options, checked by the command
     bool help = false;  // --help or -h: print the usage and nothing else
 };
 
