@@ -13,7 +13,7 @@ namespace {
 enum OptId {
     kBuffer = 256, kThread, kBlockSize, kRingSize, kStreaming, kNotSeekable, kDetectDisc,
     kSeek, kBackward, kQuery, kResync, kThumbnail, kNoAudio, kNoVideo, kMaxFrames, kDumpStreams,
-    kLog, kPlugin, kHelp,
+    kLog, kPlugin, kHelp, kVersion,
 };
 
 const option kLongOptions[] = {
@@ -36,6 +36,7 @@ const option kLongOptions[] = {
     {"log", no_argument, nullptr, kLog},
     {"plugin", required_argument, nullptr, kPlugin},
     {"help", no_argument, nullptr, kHelp},
+    {"version", no_argument, nullptr, kVersion},
     {nullptr, 0, nullptr, 0},
 };
 
@@ -55,7 +56,7 @@ const char* usage_text() {
     return "usage: asfdump probe FILE\n"
            "       asfdump info FILE [input options]\n"
            "       asfdump frames FILE [input options] [play options]\n"
-           "       asfdump --help\n"
+           "       asfdump --help | --version [--plugin PATH]\n"
            "FILE may be an http:// URL (default buffering then: --buffer ring --thread)\n"
            "input options: --buffer cache|none|ring, --thread, --block-size N, --ring-size N,\n"
            "               --streaming, --not-seekable, --detect-discontinuity, --plugin PATH\n"
@@ -115,6 +116,7 @@ bool parse_options(int argc, char** argv, Options* o, std::string* error) {
             case kDumpStreams: o->dump_dir = optarg; break;
             case kLog: o->log = true; break;
             case kPlugin: o->plugin = optarg; break;
+            case kVersion: o->version = true; break;
             case kHelp:
             case 'h':
                 o->help = true;
@@ -125,6 +127,7 @@ bool parse_options(int argc, char** argv, Options* o, std::string* error) {
         }
     }
     const int rest = argc - optind;
+    if (o->version && rest == 0) return true;
     if (rest != 2) {
         *error = rest < 2 ? "missing command or file" : "too many arguments";
         return false;

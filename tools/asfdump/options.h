@@ -31,6 +31,7 @@ struct Options {
     std::string dump_dir;
     bool log = false;
     bool help = false;  // --help or -h: print the usage and nothing else
+    bool version = false;  // --version: the versions of asfdump and the loaded plug-in
 };
 
 // Parses argv; on a usage error returns false with a message in `error`.
