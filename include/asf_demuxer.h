@@ -94,7 +94,10 @@ typedef struct asf_demuxer_s {
     asf_stream_st stream_info[];
 } asf_demuxer_s, asf_demuxer_st;
 
-/* Room the host allocates: the fixed record and one audio and one video record. */
+/* Room the host allocates: the fixed record and one audio and one video record
+ * (min_context_size). For N streams: sizeof(asf_demuxer_st) + N *
+ * sizeof(asf_stream_st), in a buffer aligned to 8 bytes (add 8 otherwise);
+ * every whole record the buffer holds is used. */
 #define ASF_MIN_CONTEXT_SIZE ((int)(sizeof(asf_demuxer_st) + 2 * sizeof(asf_stream_st)))
 
 #ifdef __cplusplus

@@ -38,6 +38,10 @@ enum { STATE_STOP = 0, STATE_PLAY = 1, STATE_PAUSE = 2, STATE_ERROR = 3 };
 
 typedef struct cb_io_s cb_io_s, cb_io_st;
 
+/* The plug-in calls read, seek, tell (and seek_time, open_done,
+ * discontinuity when set) with this pointer. With use_thread and ring
+ * buffering the streaming thread calls read too, always under the reader's
+ * lock: never two calls at once. */
 struct cb_io_s {
     size_t (*read)(cb_io_st* io, void* dst, size_t len);
     size_t (*write)(cb_io_st* io, const void* src, size_t len);

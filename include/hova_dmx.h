@@ -263,18 +263,31 @@ typedef struct hova_timeline_info_s {
     uint8_t is_discontinuity;
 } hova_timeline_info_s, hova_timeline_info_st;
 
-/* ---- callbacks the host offers; each receives `context` first ---- */
+/* ---- callbacks the host offers; each receives `context` first ----
+ * Called only on the thread inside an entry point (never on the reader's
+ * streaming thread). docs/integration.md has the whole contract. */
 
 typedef struct hova_callback_s {
     int (*notify)(void* context, hova_stream_type_et type, hova_event_et event);
+    /* Every block the plug-in holds comes from malloc (during open_file only). */
     void* (*malloc)(void* context, size_t size);
-    void* (*realloc)(void* context, void* ptr, size_t size);
+    void* (*realloc)(void* context, void* ptr, size_t size); /* not called */
+    /* `pptr` is the address of the plug-in's pointer: free *(void**)pptr and
+     * set it to NULL; a NULL *pptr is accepted. */
     void (*freep)(void* context, void* pptr);
-    int64_t (*get_time)(void* context);
+    int64_t (*get_time)(void* context); /* microseconds, monotonic */
+    /* A frame buffer of `size` bytes: return 0 and store its address in
+     * *buffer; non-zero refuses. One pending frame per stream type. */
     int (*stream_alloc)(void* context, hova_stream_type_et type, void** buffer, int size);
+    /* Gives the pending frame back uncommitted. */
     int (*stream_discard)(void* context, hova_stream_type_et type);
+    /* Publishes the pending frame. packet_type 1: the configuration record
+     * (int32 codec code, then the codec data), sent once per stream before
+     * its frames; 0: a media frame, pts in microseconds (-1 unknown). */
     int (*stream_commit)(void* context, hova_stream_type_et type, int size, int64_t pts,
                          int64_t duration, int packet_type);
+    /* Grows the pending frame, keeping its bytes: 0 and the (maybe moved)
+     * address in *buffer; non-zero refuses (the frame is then discarded). */
     int (*stream_realloc)(void* context, hova_stream_type_et type, void** buffer, int size);
     int (*drm_init)(void* context, hova_drm_type_et type, void* data, int len);
     int (*drm_decrypt)(void* context, hova_stream_type_et type, void* in, int in_len, void* out,
@@ -287,7 +300,10 @@ typedef struct hova_callback_s {
     void* context;
 } hova_callback_s, hova_callback_st;
 
-/* ---- the descriptor a demuxer plug-in exports ---- */
+/* ---- the descriptor a demuxer plug-in exports ----
+ * open_file stores the context (the first 8-byte boundary in `buffer`, not
+ * always `buffer`) through `ctx`; every later slot takes that pointer. The
+ * entry points of one context are called from one thread at a time. */
 
 typedef struct hova_dmx_func_s {
     int (*probe)(const uint8_t* header, int len, cb_io_st* cbio, hova_probe_method_et method);
@@ -312,7 +328,7 @@ typedef struct hova_dmx_func_s {
     int (*queue_avframe)(void* ctx, int count, hova_stream_type_et type, int64_t pts);
     int (*deliver_avframe)(void* ctx, int* size, int64_t* pts, hova_stream_type_et type);
     int (*peek_avframe)(void* ctx, int* size, int64_t* pts, hova_stream_type_et type);
-    int min_context_size;
+    int min_context_size; /* the context with two stream records; see asf_demuxer.h for more */
     int support_avframe_video;
     int support_avframe_audio;
     int support_fast_track_switch;

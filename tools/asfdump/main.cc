@@ -1,5 +1,6 @@
 // asfdump: the reference host's command line. Loads libplimo_asf.so as the
 // framework does and drives its descriptor.
+#include <dlfcn.h>
 #include <unistd.h>
 
 #include <climits>
@@ -10,6 +11,7 @@
 #include "commands.h"
 #include "loader.h"
 #include "options.h"
+#include "plugin_version.h"
 
 namespace {
 
@@ -37,6 +39,16 @@ bool load_plugin(host::PluginLoader& loader, const asfdump::Options& opts, const
     return false;
 }
 
+// asfdump's own version, then the version note of the plug-in it loaded.
+int print_version(const hova_dmx_func_st* dmx) {
+    Dl_info where{};
+    const bool found = dladdr(dmx, &where) != 0 && where.dli_fname;
+    const std::string v = host::plugin_version(dmx);
+    std::printf("asfdump %s\nlibplimo_asf %s (%s)\n", PLIMO_VERSION, v.empty() ? "unknown" : v.c_str(),
+                found ? where.dli_fname : "?");
+    return asfdump::kExitOk;
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
@@ -50,6 +62,11 @@ int main(int argc, char** argv) {
     if (opts.help) {
         std::fputs(asfdump::usage_text(), stdout);
         return asfdump::kExitOk;
+    }
+    if (opts.version) {
+        host::PluginLoader loader;
+        if (!load_plugin(loader, opts, argv[0])) return asfdump::kExitOpenFailed;
+        return print_version(loader.descriptor());
     }
     if (!opts.is_url && access(opts.file.c_str(), R_OK) != 0) {
         std::fprintf(stderr, "asfdump: cannot read %s\n", opts.file.c_str());

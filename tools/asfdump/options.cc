@@ -13,7 +13,7 @@ namespace {
 enum OptId {
     kBuffer = 256, kThread, kBlockSize, kRingSize, kStreaming, kNotSeekable, kDetectDisc,
     kSeek, kBackward, kQuery, kResync, kThumbnail, kNoAudio, kNoVideo, kMaxFrames, kDumpStreams,
-    kLog, kPlugin, kHelp, kThumbAt, kThumbWidth, kThumbEvery, kThumbSheet, kThumbColumns,
+    kLog, kPlugin, kHelp, kVersion, kThumbAt, kThumbWidth, kThumbEvery, kThumbSheet, kThumbColumns,
 };
 
 const option kLongOptions[] = {
@@ -36,6 +36,7 @@ const option kLongOptions[] = {
     {"log", no_argument, nullptr, kLog},
     {"plugin", required_argument, nullptr, kPlugin},
     {"help", no_argument, nullptr, kHelp},
+    {"version", no_argument, nullptr, kVersion},
     {"at", required_argument, nullptr, kThumbAt},
     {"width", required_argument, nullptr, kThumbWidth},
     {"every", required_argument, nullptr, kThumbEvery},
@@ -62,7 +63,7 @@ const char* usage_text() {
            "       asfdump frames FILE [input options] [play options]\n"
            "       asfdump thumb FILE --at TIME -o OUT.png [--width N]\n"
            "       asfdump thumb FILE --every DURATION --sheet OUT.png [--columns N] [--width N]\n"
-           "       asfdump --help\n"
+           "       asfdump --help | --version [--plugin PATH]\n"
            "FILE may be an http:// URL (default buffering then: --buffer ring --thread)\n"
            "input options: --buffer cache|none|ring, --thread, --block-size N, --ring-size N,\n"
            "               --streaming, --not-seekable, --detect-discontinuity, --plugin PATH\n"
@@ -122,6 +123,7 @@ bool parse_options(int argc, char** argv, Options* o, std::string* error) {
             case kDumpStreams: o->dump_dir = optarg; break;
             case kLog: o->log = true; break;
             case kPlugin: o->plugin = optarg; break;
+            case kVersion: o->version = true; break;
             case kThumbAt: o->thumb.at = optarg; break;
             case 'o': o->thumb.output = optarg; break;
             case kThumbWidth: o->thumb.width = optarg; break;
@@ -138,6 +140,7 @@ bool parse_options(int argc, char** argv, Options* o, std::string* error) {
         }
     }
     const int rest = argc - optind;
+    if (o->version && rest == 0) return true;
     if (rest != 2) {
         *error = rest < 2 ? "missing command or file" : "too many arguments";
         return false;

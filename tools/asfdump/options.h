@@ -42,6 +42,7 @@ struct Options {
     bool log = false;
     ThumbArgs thumb;  // thumb's own options, checked by the command
     bool help = false;  // --help or -h: print the usage and nothing else
+    bool version = false;  // --version: the versions of asfdump and the loaded plug-in
 };
 
 // Parses argv; on a usage error returns false with a message in `error`.
