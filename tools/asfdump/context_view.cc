@@ -11,6 +11,7 @@ ContextView view_context(const void* ctx) {
     v.packet_size = d->packet_size;
     v.index_entries = d->index_packet != 0 ? d->index_count : 0;
     v.index_interval_us = static_cast<int64_t>(d->index_time_interval);
+    v.index_start_us = d->index_start_offset;
     v.separate_parsing = d->parse_mode == PARSE_SEP || d->parse_file_end != 0;
     for (int i = 0; i < d->s.total_streams && i < d->max_streams; ++i) {
         const asf_stream_st& r = d->stream_info[i];

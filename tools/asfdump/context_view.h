@@ -24,6 +24,7 @@ struct ContextView {
     uint32_t packet_size = 0;
     uint32_t index_entries = 0;       // 0: no simple index found (or not looked for)
     int64_t index_interval_us = 0;
+    int64_t index_start_us = -1;      // time of entry 0; -1 until the plug-in worked it out (first seek)
     bool separate_parsing = false;    // delivery switched (bad interleaving)
     std::vector<StreamView> audio, video;  // in the order of get_info's indexes
 };
