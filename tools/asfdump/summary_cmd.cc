@@ -85,7 +85,7 @@ std::string video_line(int i, const hova_video_info_st& r, const StreamView& s) 
 // The end of a stream line: language, active or not, the ASF stream number.
 std::string stream_tail(const std::string& language, const StreamView& s) {
     std::string t = language.empty() ? "" : ", " + language;
-    t += s.active ? ", active" : ", not active (the plug-in plays one audio and one video stream)";
+    t += s.active ? ", active" : ", not active";
     return t + " [ASF stream " + std::to_string(s.stream_num) + "]";
 }
 
@@ -146,6 +146,10 @@ int run_summary(const hova_dmx_func_st* dmx, const Options& opts) {
     }
     if (prog.num_audio_streams + prog.num_video_streams == 0) row("stream", "none that is audio or video");
 
+    bool inactive = false;
+    for (const auto* list : {&view.audio, &view.video})
+        for (const StreamView& sv : *list) inactive = inactive || !sv.active;
+    if (inactive) row("note", "the plug-in plays the last audio and the last video stream of the header only");
     const FileProperties props = opts.is_url ? FileProperties{} : read_file_properties(opts.file);
     if (props.broadcast || (!props.found && prog.duration == 0))
         row("note", props.found && props.packet_count == 0
