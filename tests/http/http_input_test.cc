@@ -249,8 +249,8 @@ TEST(HttpInput, AsfdumpTakesAUrlWhereItTakesAFile) {
         {"frames " + url + " --buffer none --seek 10000000", 0,
          "frames" + file + " --buffer none --seek 10000000", ""},
         {"info " + url, 0, "info" + file, ""},
-        {"frames " + server->url(base_name(path), false) + " --seek 10000000", 0, "",
-         "ignores range requests"},
+        {"frames " + server->url(base_name(path), false) + " --seek 10000000", 4, "",
+         "ignores range requests"},  // the seek is refused: the play runs, status 4
         {"info " + server->url("no-such-file.wmv"), 3, "", "HTTP status 404"},
         {"frames http://127.0.0.1:1/x.wmv", 3, "", "cannot read"},
         {"frames " + cutting.url, 3, "", "connection cut at byte"},

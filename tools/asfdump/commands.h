@@ -13,12 +13,23 @@ int run_probe(const hova_dmx_func_st* dmx, const Options& opts);
 int run_info(const hova_dmx_func_st* dmx, const Options& opts);
 int run_frames(const hova_dmx_func_st* dmx, const Options& opts);
 int run_thumb(const hova_dmx_func_st* dmx, const Options& opts);
+int run_summary(const hova_dmx_func_st* dmx, const Options& opts);
+int run_stats(const hova_dmx_func_st* dmx, const Options& opts);
 
-// The session over the file with the input the options describe; null, said
-// on stderr, when the file cannot be read.
-std::unique_ptr<host::Session> make_session(const hova_dmx_func_st* dmx, const Options& opts);
-// open_file; a failure is said on stderr.
-bool open_session(host::Session& session);
+// Stream records the summary and stats give the context: as many as the
+// plug-in uses, so that every stream of the file is held.
+constexpr int kAllRecords = 127;
+// Context bytes for `records` stream records.
+int context_size_for(const hova_dmx_func_st* dmx, int records);
+
+// The session over the file with the input the options describe and a context
+// of --streams records, else `default_records` (-1: min_context_size, as the
+// framework allocates); null, said on stderr, when the file cannot be read.
+std::unique_ptr<host::Session> make_session(const hova_dmx_func_st* dmx, const Options& opts,
+                                            int default_records = -1);
+// open_file; a failure is said on stderr with its code and a reason a person
+// can act on.
+bool open_session(host::Session& session, const Options& opts);
 
 // The raw input over the file or URL; null, said on stderr, when it cannot
 // be read.

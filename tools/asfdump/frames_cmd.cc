@@ -102,11 +102,13 @@ void print_events(host::HostCallbacks& cb, size_t* next, const std::vector<int32
 }
 
 // Host-side steps before the first get_data call: track and thumbnail
-// choices, then a seek or resynchronisation when asked for.
-void before_playing(const hova_dmx_func_st* dmx, void* ctx, const Options& opts) {
+// choices, then a seek or resynchronisation when asked for. False when the
+// plug-in refused the seek or the resynchronisation.
+bool before_playing(const hova_dmx_func_st* dmx, void* ctx, const Options& opts) {
     if (opts.no_audio) dmx->set_track(ctx, HOVA_STREAM_AUDIO, -1, 0, HOVA_INPUT_MASTER);
     if (opts.no_video) dmx->set_track(ctx, HOVA_STREAM_VIDEO, -1, 0, HOVA_INPUT_MASTER);
     if (opts.has_thumbnail) dmx->set_multi_thumb(ctx, opts.thumbnail_us);
+    bool accepted = true;
     if (opts.has_seek) {
         int64_t pts = opts.seek_us;
         const int r = dmx->seek_time(ctx, opts.backward ? HOVA_SEEK_BACKWARD : HOVA_SEEK_FORWARD, &pts,
@@ -116,6 +118,7 @@ void before_playing(const hova_dmx_func_st* dmx, void* ctx, const Options& opts)
         j["result"] = r;
         j["pts"] = pts;
         emit(j);
+        accepted = r == HOVA_OK;
     }
     if (opts.has_resync) {
         const int r = dmx->resync_time(ctx, opts.resync_us);
@@ -124,7 +127,9 @@ void before_playing(const hova_dmx_func_st* dmx, void* ctx, const Options& opts)
         j["result"] = r;
         j["pts"] = opts.resync_us;
         emit(j);
+        accepted = accepted && r == HOVA_OK;
     }
+    return accepted;
 }
 
 }  // namespace
@@ -151,9 +156,9 @@ int run_frames(const hova_dmx_func_st* dmx, const Options& opts) {
         }
     };
 
-    if (!open_session(*session)) return report_network(session->input(), opts) ? kExitOpenFailed : kExitUnreadable;
+    if (!open_session(*session, opts)) return report_network(session->input(), opts) ? kExitOpenFailed : kExitUnreadable;
     void* ctx = session->context();
-    before_playing(dmx, ctx, opts);
+    const bool accepted = before_playing(dmx, ctx, opts);
 
     size_t next_event = 0, next_codec = 0;
     print_events(cb, &next_event, config_codecs, &next_codec);
@@ -188,7 +193,13 @@ int run_frames(const hova_dmx_func_st* dmx, const Options& opts) {
     std::fflush(stdout);
     // A connection cut during play ends the stream like the end of the file;
     // the status says that the file was not read to its end.
-    return report_network(session->input(), opts) ? kExitOk : kExitUnreadable;
+    if (!report_network(session->input(), opts)) return kExitUnreadable;
+    if (!accepted) {
+        std::fprintf(stderr, "asfdump: the plug-in refused the %s (the play ran from where it was)\n",
+                     opts.has_seek && opts.has_resync ? "seek or resync" : opts.has_seek ? "seek" : "resync");
+        return kExitRefused;
+    }
+    return kExitOk;
 }
 
 }  // namespace asfdump

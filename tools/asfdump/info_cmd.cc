@@ -7,6 +7,7 @@
 
 #include "codec_names.h"
 #include "commands.h"
+#include "record_text.h"
 #include "session.h"
 
 namespace asfdump {
@@ -15,55 +16,13 @@ namespace {
 
 using nlohmann::json;
 
-// UTF-16LE bytes to UTF-8, pairing surrogates; stops at a zero unit.
-std::string utf16le_to_utf8(const unsigned char* p, size_t size) {
-    std::string out;
-    for (size_t i = 0; i + 1 < size; i += 2) {
-        uint32_t c = static_cast<uint32_t>(p[i] | (p[i + 1] << 8));
-        if (c == 0) break;
-        if (c >= 0xD800 && c <= 0xDBFF && i + 3 < size) {
-            const uint32_t lo = static_cast<uint32_t>(p[i + 2] | (p[i + 3] << 8));
-            if (lo >= 0xDC00 && lo <= 0xDFFF) {
-                c = 0x10000 + ((c - 0xD800) << 10) + (lo - 0xDC00);
-                i += 2;
-            }
-        }
-        if (c < 0x80) {
-            out += static_cast<char>(c);
-        } else if (c < 0x800) {
-            out += static_cast<char>(0xC0 | (c >> 6));
-            out += static_cast<char>(0x80 | (c & 0x3F));
-        } else if (c < 0x10000) {
-            out += static_cast<char>(0xE0 | (c >> 12));
-            out += static_cast<char>(0x80 | ((c >> 6) & 0x3F));
-            out += static_cast<char>(0x80 | (c & 0x3F));
-        } else {
-            out += static_cast<char>(0xF0 | (c >> 18));
-            out += static_cast<char>(0x80 | ((c >> 12) & 0x3F));
-            out += static_cast<char>(0x80 | ((c >> 6) & 0x3F));
-            out += static_cast<char>(0x80 | (c & 0x3F));
-        }
-    }
-    return out;
-}
-
 // Text that may not be valid UTF-8 is kept where it is and replaced where it
 // is not, so that the JSON stays valid.
 json text(const std::string& s) {
     return json::parse(json(s).dump(-1, ' ', false, json::error_handler_t::replace));
 }
 
-json string_info(const hova_string_info_st& s) {
-    if (!s.payload) return nullptr;
-    std::string t;
-    if (s.stringformat == HOVA_STRING_FORMAT_UTF16LE || s.stringformat == HOVA_STRING_FORMAT_UTF16BE ||
-        s.stringformat == HOVA_STRING_FORMAT_UCS2)
-        t = utf16le_to_utf8(s.payload, s.size);
-    else
-        t.assign(reinterpret_cast<const char*>(s.payload), s.size);
-    while (!t.empty() && t.back() == '\0') t.pop_back();
-    return text(t);
-}
+json string_info(const hova_string_info_st& s) { return s.payload ? text(record_text(s)) : json(nullptr); }
 
 json c_string(const char* s) { return s ? text(s) : json(nullptr); }
 
@@ -126,11 +85,6 @@ json program_json(const hova_program_info_st& p) {
     };
 }
 
-std::string language(const char (&l)[4]) {
-    std::string s(l, 4);
-    return s.substr(0, s.find('\0'));
-}
-
 json audio_json(const hova_audio_info_st& a) {
     return json{{"stream_id", a.stream_id},
                 {"codec", a.codec},
@@ -140,7 +94,7 @@ json audio_json(const hova_audio_info_st& a) {
                 {"channel_num", a.channel_num},
                 {"desc", data_info(a.desc)},
                 {"tag_title", name_info(a.tag_title)},
-                {"language", text(language(a.language))},
+                {"language", text(record_language(a.language))},
                 {"component_tag", a.component_tag},
                 {"is_audio_description", a.is_audio_description}};
 }
@@ -194,7 +148,7 @@ json video_json(const hova_video_info_st& v) {
 int run_info(const hova_dmx_func_st* dmx, const Options& opts) {
     auto session = make_session(dmx, opts);
     if (!session) return kExitUnreadable;
-    if (!open_session(*session)) return report_network(session->input(), opts) ? kExitOpenFailed : kExitUnreadable;
+    if (!open_session(*session, opts)) return report_network(session->input(), opts) ? kExitOpenFailed : kExitUnreadable;
     void* ctx = session->context();
 
     hova_clip_info_st clip{};

@@ -9,6 +9,7 @@
 #include <string>
 
 #include "commands.h"
+#include "file_check.h"
 #include "loader.h"
 #include "options.h"
 #include "plugin_version.h"
@@ -49,16 +50,38 @@ int print_version(const hova_dmx_func_st* dmx) {
     return asfdump::kExitOk;
 }
 
+// The command words and what runs them; no word: the summary.
+struct Command {
+    const char* name;
+    int (*run)(const hova_dmx_func_st*, const asfdump::Options&);
+};
+constexpr Command kCommands[] = {
+    {"", asfdump::run_summary},
+    {"probe", asfdump::run_probe},
+    {"info", asfdump::run_info},
+    {"frames", asfdump::run_frames},
+    {"stats", asfdump::run_stats},
+    {"thumb", asfdump::run_thumb},
+};
+
+const Command* find_command(const std::string& name) {
+    for (const Command& c : kCommands)
+        if (name == c.name) return &c;
+    return nullptr;
+}
+
+int usage_error(const std::string& error) {
+    std::fprintf(stderr, "asfdump: %s\n", error.c_str());
+    std::fputs(asfdump::usage_text(), stderr);
+    return asfdump::kExitUsage;
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
     asfdump::Options opts;
     std::string error;
-    if (!asfdump::parse_options(argc, argv, &opts, &error)) {
-        if (!error.empty()) std::fprintf(stderr, "asfdump: %s\n", error.c_str());
-        std::fputs(asfdump::usage_text(), stderr);
-        return asfdump::kExitUsage;
-    }
+    if (!asfdump::parse_options(argc, argv, &opts, &error)) return usage_error(error);
     if (opts.help) {
         std::fputs(asfdump::usage_text(), stdout);
         return asfdump::kExitOk;
@@ -68,20 +91,19 @@ int main(int argc, char** argv) {
         if (!load_plugin(loader, opts, argv[0])) return asfdump::kExitOpenFailed;
         return print_version(loader.descriptor());
     }
-    if (!opts.is_url && access(opts.file.c_str(), R_OK) != 0) {
-        std::fprintf(stderr, "asfdump: cannot read %s\n", opts.file.c_str());
-        return asfdump::kExitUnreadable;
+    const Command* command = find_command(opts.command);
+    if (!command) return usage_error("unknown command " + opts.command);
+    // "asfdump probe" alone is a command without its file, not a file named probe.
+    if (opts.command.empty() && find_command(opts.file) && access(opts.file.c_str(), F_OK) != 0)
+        return usage_error("missing file after " + opts.file);
+    if (!opts.is_url) {
+        const int status = asfdump::check_file(opts.file);
+        if (status != asfdump::kExitOk) return status;
     }
     host::PluginLoader loader;
     if (!load_plugin(loader, opts, argv[0])) return asfdump::kExitOpenFailed;
-    const hova_dmx_func_st* dmx = loader.descriptor();
 
     // The plug-in's log goes to stderr only when asked for.
     if (!opts.log) setenv("PLIMO_LOG", "off", 1);
-    if (opts.command == "probe") return asfdump::run_probe(dmx, opts);
-    if (opts.command == "info") return asfdump::run_info(dmx, opts);
-    if (opts.command == "frames") return asfdump::run_frames(dmx, opts);
-    if (opts.command == "thumb") return asfdump::run_thumb(dmx, opts);
-    std::fprintf(stderr, "asfdump: %s is not available yet\n", opts.command.c_str());
-    return asfdump::kExitUsage;
+    return command->run(loader.descriptor(), opts);
 }

@@ -6,6 +6,8 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "time_arg.h"
+
 namespace asfdump {
 
 namespace {
@@ -13,7 +15,7 @@ namespace {
 enum OptId {
     kBuffer = 256, kThread, kBlockSize, kRingSize, kStreaming, kNotSeekable, kDetectDisc,
     kSeek, kBackward, kQuery, kResync, kThumbnail, kNoAudio, kNoVideo, kMaxFrames, kDumpStreams,
-    kLog, kPlugin, kHelp, kVersion, kThumbAt, kThumbWidth, kThumbEvery, kThumbSheet, kThumbColumns,
+    kLog, kPlugin, kHelp, kStreams, kVersion, kThumbAt, kThumbWidth, kThumbEvery, kThumbSheet, kThumbColumns,
 };
 
 const option kLongOptions[] = {
@@ -36,6 +38,7 @@ const option kLongOptions[] = {
     {"log", no_argument, nullptr, kLog},
     {"plugin", required_argument, nullptr, kPlugin},
     {"help", no_argument, nullptr, kHelp},
+    {"streams", required_argument, nullptr, kStreams},
     {"version", no_argument, nullptr, kVersion},
     {"at", required_argument, nullptr, kThumbAt},
     {"width", required_argument, nullptr, kThumbWidth},
@@ -44,6 +47,8 @@ const option kLongOptions[] = {
     {"columns", required_argument, nullptr, kThumbColumns},
     {nullptr, 0, nullptr, 0},
 };
+
+constexpr const char* kTimeForms = " (a time: 30s, 1:02.5, 500ms, 1h2m or microseconds)";
 
 bool parse_int(const char* text, int64_t lo, int64_t hi, int64_t* out) {
     if (!text || !*text) return false;
@@ -58,17 +63,32 @@ bool parse_int(const char* text, int64_t lo, int64_t hi, int64_t* out) {
 }  // namespace
 
 const char* usage_text() {
-    return "usage: asfdump probe FILE\n"
-           "       asfdump info FILE [input options]\n"
+    return "usage: asfdump FILE [input options]           a summary for a person\n"
+           "       asfdump probe FILE                     prints 1 (ASF, exit 0) or 0 (exit 1)\n"
+           "       asfdump info FILE [input options]      every record get_info gives, one JSON object\n"
            "       asfdump frames FILE [input options] [play options]\n"
+           "                                              JSON Lines, one host event per line\n"
+           "       asfdump stats FILE [input options]     per stream: frames, times, bit rate, gaps,\n"
+           "                                              key-frame interval; the index checked\n"
            "       asfdump thumb FILE --at TIME -o OUT.png [--width N]\n"
            "       asfdump thumb FILE --every DURATION --sheet OUT.png [--columns N] [--width N]\n"
            "       asfdump --help | --version [--plugin PATH]\n"
+           "summary: container, duration (h:mm:ss.mmm), how it seeks (index / search / not), title,\n"
+           "artist, album, year, genre, cover; a line per stream (codec, size or rate and channels,\n"
+           "bit rate, language, active or not); notes (bad interleaving, broadcast capture)\n"
+           "stats: key frames are what a second play in thumbnail mode delivers; each index\n"
+           "entry must lead a seek to the latest key frame at or before its time\n"
            "FILE may be an http:// URL (default buffering then: --buffer ring --thread)\n"
            "input options: --buffer cache|none|ring, --thread, --block-size N, --ring-size N,\n"
-           "               --streaming, --not-seekable, --detect-discontinuity, --plugin PATH\n"
-           "play options:  --seek US, --backward, --query, --resync US, --thumbnail US,\n"
-           "               --no-audio, --no-video, --max-frames N, --dump-streams DIR, --log\n";
+           "               --streaming, --not-seekable, --detect-discontinuity, --plugin PATH,\n"
+           "               --streams N (stream records the context holds, 0 to 127; default:\n"
+           "               as many as min_context_size holds for info and frames, 127 otherwise)\n"
+           "play options:  --seek TIME, --backward, --query, --resync TIME, --thumbnail TIME,\n"
+           "               --no-audio, --no-video, --max-frames N, --dump-streams DIR, --log\n"
+           "TIME: 30s, 1:02.5, 1:02:03, 500ms, 1h2m, 1h2m3.5s or microseconds (2000000)\n"
+           "exit status: 0 played (or summarised) to the end or to --max-frames; 1 open failed\n"
+           "(the reason on stderr); 2 usage error; 3 the file cannot be read; 4 a --seek or\n"
+           "--resync the plug-in refused (the play still runs)\n";
 }
 
 bool parse_options(int argc, char** argv, Options* o, std::string* error) {
@@ -102,17 +122,17 @@ bool parse_options(int argc, char** argv, Options* o, std::string* error) {
             case kNotSeekable: o->not_seekable = true; break;
             case kDetectDisc: o->input.detect_discontinuity = 1; break;
             case kSeek:
-                if (!parse_int(optarg, INT64_MIN, INT64_MAX, &o->seek_us)) { *error = "bad --seek"; return false; }
+                if (!parse_time_us(optarg, &o->seek_us)) { *error = "bad --seek " + std::string(optarg) + kTimeForms; return false; }
                 o->has_seek = true;
                 break;
             case kBackward: o->backward = true; break;
             case kQuery: o->query = true; break;
             case kResync:
-                if (!parse_int(optarg, INT64_MIN, INT64_MAX, &o->resync_us)) { *error = "bad --resync"; return false; }
+                if (!parse_time_us(optarg, &o->resync_us)) { *error = "bad --resync " + std::string(optarg) + kTimeForms; return false; }
                 o->has_resync = true;
                 break;
             case kThumbnail:
-                if (!parse_int(optarg, INT64_MIN, INT64_MAX, &o->thumbnail_us)) { *error = "bad --thumbnail"; return false; }
+                if (!parse_time_us(optarg, &o->thumbnail_us)) { *error = "bad --thumbnail " + std::string(optarg) + kTimeForms; return false; }
                 o->has_thumbnail = true;
                 break;
             case kNoAudio: o->no_audio = true; break;
@@ -123,6 +143,10 @@ bool parse_options(int argc, char** argv, Options* o, std::string* error) {
             case kDumpStreams: o->dump_dir = optarg; break;
             case kLog: o->log = true; break;
             case kPlugin: o->plugin = optarg; break;
+            case kStreams:
+                if (!parse_int(optarg, 0, 127, &v)) { *error = "bad --streams (0 to 127)"; return false; }
+                o->streams = static_cast<int>(v);
+                break;
             case kVersion: o->version = true; break;
             case kThumbAt: o->thumb.at = optarg; break;
             case 'o': o->thumb.output = optarg; break;
@@ -141,17 +165,12 @@ bool parse_options(int argc, char** argv, Options* o, std::string* error) {
     }
     const int rest = argc - optind;
     if (o->version && rest == 0) return true;
-    if (rest != 2) {
-        *error = rest < 2 ? "missing command or file" : "too many arguments";
+    if (rest < 1 || rest > 2) {
+        *error = rest < 1 ? "missing file" : "too many arguments";
         return false;
     }
-    o->command = argv[optind];
-    o->file = argv[optind + 1];
-    if (o->command != "probe" && o->command != "info" && o->command != "frames" &&
-        o->command != "thumb") {
-        *error = "unknown command " + o->command;
-        return false;
-    }
+    if (rest == 2) o->command = argv[optind];
+    o->file = argv[optind + rest - 1];
     o->is_url = host::is_http_url(o->file);
     // Network input defaults to what the framework uses for it: the ring
     // filled by the streaming thread. Any buffering option replaces that.

@@ -19,13 +19,14 @@ struct ThumbArgs {
 };
 
 struct Options {
-    std::string command;
+    std::string command;  // empty: the summary for a person
     std::string file;
     std::string plugin;  // --plugin PATH
     host::InputOptions input;
     int ring_size = 1048576;
     bool not_seekable = false;
     bool is_url = false;  // FILE is an http:// URL
+    int streams = -1;     // --streams N: stream records in the context; -1: the command's default
     // play options
     bool has_seek = false;
     int64_t seek_us = 0;
@@ -45,12 +46,14 @@ struct Options {
     bool version = false;  // --version: the versions of asfdump and the loaded plug-in
 };
 
-// Parses argv; on a usage error returns false with a message in `error`.
+// Parses argv: `[COMMAND] FILE` and options in any order (one positional
+// argument is the file, for the summary). Which command words exist is
+// main.cc's table. On a usage error returns false with a message in `error`.
 // With --help (or -h) anywhere it returns true with `help` set at once.
 bool parse_options(int argc, char** argv, Options* out, std::string* error);
 
 const char* usage_text();
 
-enum ExitCode { kExitOk = 0, kExitOpenFailed = 1, kExitUsage = 2, kExitUnreadable = 3 };
+enum ExitCode { kExitOk = 0, kExitOpenFailed = 1, kExitUsage = 2, kExitUnreadable = 3, kExitRefused = 4 };
 
 }  // namespace asfdump

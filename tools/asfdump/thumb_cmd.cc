@@ -129,7 +129,7 @@ Opened open_video(const hova_dmx_func_st* dmx, const Options& opts, Delivery* de
         return o;
     }
     delivery->attach(o.session->callbacks());
-    if (!open_session(*o.session)) {
+    if (!open_session(*o.session, opts)) {
         o.status = report_network(o.session->input(), opts) ? kExitOpenFailed : kExitUnreadable;
         return o;
     }

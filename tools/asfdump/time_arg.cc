@@ -17,6 +17,8 @@ bool read_number(const char** p, double* v) {
     errno = 0;
     *v = std::strtod(s, &end);
     if (end == s || errno != 0 || !std::isfinite(*v)) return false;
+    // Digits and one point only: strtod also takes exponents and hex ("1e3", "0x10").
+    if (static_cast<size_t>(end - s) != std::strspn(s, "0123456789.")) return false;
     *p = end;
     return true;
 }
