@@ -415,15 +415,27 @@ int64_t asf_realign_packet(asf_demuxer_st* d) {
             }
         }
     }
-    // The grid moves with the packets; a grid that would leave the 32-bit
-    // range stays where it is.
-    const int64_t shift = found == UINT64_MAX ? 0 : static_cast<int64_t>(found - grid);
+    // A start a whole number of packets from the grid is on it (a host's
+    // resync lands anywhere on it): delivery counts from that packet. Only
+    // a start within reach of a slot moves the grid, by the distance to that
+    // slot; a grid that would leave the 32-bit range stays where it is.
+    if (found == UINT64_MAX || found < d->first_packet) {
+        (void)cb->cb_seek64(cb, static_cast<cb_off_t>(pos), CB_SEEK_SET);
+        return 0;
+    }
+    const uint64_t off = (found - d->first_packet) % d->packet_size;
+    // To the nearer slot: ahead of the start (grid later) or behind it.
+    const int64_t shift = off <= d->packet_size - off ? static_cast<int64_t>(off)
+                                                       : -static_cast<int64_t>(d->packet_size - off);
     const int64_t first = static_cast<int64_t>(d->first_packet) + shift;
-    if (found == UINT64_MAX || first < 0 || first > static_cast<int64_t>(UINT32_MAX)) {
+    if (shift > kRealignReach || shift < -kRealignReach || first < 0 ||
+        first > static_cast<int64_t>(UINT32_MAX)) {
         (void)cb->cb_seek64(cb, static_cast<cb_off_t>(pos), CB_SEEK_SET);
         return 0;
     }
     d->first_packet = static_cast<uint32_t>(first);
+    d->cur_packets = (found - d->first_packet) / d->packet_size;
+    p->num = d->cur_packets;
     (void)cb->cb_seek64(cb, static_cast<cb_off_t>(found), CB_SEEK_SET);
     return static_cast<int64_t>(found - pos);
 }
