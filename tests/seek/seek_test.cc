@@ -16,6 +16,7 @@ namespace {
 
 using asfb::Bytes;
 using delivery::Player;
+using host::EventKind;
 constexpr int B = HOVA_SEEK_BACKWARD, F = HOVA_SEEK_FORWARD;
 constexpr hova_stream_type_et kAudio = HOVA_STREAM_AUDIO, kVideo = HOVA_STREAM_VIDEO;
 
@@ -92,13 +93,19 @@ Frames committed(Player& p, hova_stream_type_et t, size_t from, size_t to) {
 }
 
 // Where a seek to `t` lands among `all`: the last key frame at or before it
-// backward (the first object when there is none), the first at or after it
-// forward (none: -1). Time 0 is the first object either way.
+// backward (the first key frame when there is none), the first at or after
+// it forward (none: -1). Time 0 is the first object either way.
 int land(const Frames& all, int64_t t, int dir) {
-    int at = dir == B || t == 0 ? 0 : -1;
-    for (size_t i = 0; i < all.size() && t != 0; ++i)
-        if (all[i].key && (dir == B ? all[i].pts <= t : all[i].pts >= t && at < 0)) at = int(i);
+    if (t == 0) return 0;
+    int at = -1;
+    for (size_t i = 0; i < all.size(); ++i)
+        if (all[i].key && (dir == B ? all[i].pts <= t || at < 0 : all[i].pts >= t && at < 0)) at = int(i);
     return at;
+}
+// Video resumes at the first key frame from there.
+int first_key(const Frames& all, int from) {
+    while (size_t(from) < all.size() && !all[size_t(from)].key) ++from;
+    return from;
 }
 
 // Many targets, both directions, with and without a usable index, in every
@@ -160,8 +167,9 @@ TEST(SeekSweep, LandsOnTheKeyFrameOnTheAskedSideInEveryMode) {
                             EXPECT_TRUE(std::equal(tail.begin(), tail.end(), ref->begin() + long(head.size())));
                             continue;
                         }
-                        const int at = kind == own || !sep ? land(all, t, dir) : land(*ref, t, dir);
+                        int at = kind == own || !sep ? land(all, t, dir) : land(*ref, t, dir);
                         ASSERT_GE(at, 0);
+                        if (kind == kVideo) at = first_key(*ref, at);
                         EXPECT_EQ(tail, Frames(ref->begin() + at, ref->end() - 1)) << (kind == own ? "own" : "other");
                     }
                     const int at = land(all, target, dir);
@@ -172,46 +180,160 @@ TEST(SeekSweep, LandsOnTheKeyFrameOnTheAskedSideInEveryMode) {
     }
 }
 
-// Every frame a key frame, so the index alone decides where a seek lands.
-// Entry 0's time is worked out from the first entry naming another packet;
-// the walk goes from the target's entry to the next one naming another
-// packet and steps on until the key frame lies on the asked side, and a
+// Every frame from the first key frame on a key frame, so the index alone
+// decides where a seek lands. Entry 0's time is worked out from the first
+// entry naming another packet; the walk goes from the target's entry to the
+// next one naming another packet and steps on until the key frame lies on
+// the asked side (backward, entry 0's key frame when none is earlier), and a
 // forward seek back while an earlier named key frame is still after the
-// target; an index that cannot answer leaves the seek to the search without
-// index.
+// target; an index that cannot answer (a forward target in the last entry's
+// interval) leaves the seek to the search without index, and fails it on a
+// network input.
 TEST(IndexSeek, WalksFromTheTargetsEntryToTheNextDistinctKeyFrame) {
+    constexpr int64_t kFails = -1;
     const struct {
         std::vector<uint32_t> entries;
         int64_t start_offset;
-        std::vector<std::array<int64_t, 3>> seeks;  // direction, target, time found
+        std::vector<std::array<int64_t, 4>> seeks;  // direction, target, time found, on a network
+        uint32_t key_first = 0;
     } cases[] = {
         {{0, 10, 20, 25, 28, 40, 40, 70, 80, 90}, 0,
-         {{B, 2200000, 2000000}, {F, 2200000, 2500000}, {B, 2900000, 2500000}, {F, 2900000, 4000000},
-          {B, 2000000, 2000000}, {F, 2000000, 2500000},   // passed over
-          {B, 5500000, 4000000}, {F, 5500000, 7000000},   // over the repeat
-          {B, 9500000, 9000000}, {F, 9500000, 9500000}, {B, -3000000, 0}}},  // by the search
+         {{B, 2200000, 2000000, 2000000}, {F, 2200000, 2500000, 2500000}, {B, 2900000, 2500000, 2500000},
+          {F, 2900000, 4000000, 4000000}, {B, 2000000, 2000000, 2000000},
+          {F, 2000000, 2500000, 2500000},  // passed over
+          {B, 5500000, 4000000, 4000000}, {F, 5500000, 7000000, 7000000},  // over the repeat
+          {B, 9500000, 9000000, 9000000}, {F, 9500000, 9500000, kFails}, {B, -3000000, 0, 0}}},
         {{0, 0, 0, 0, 5, 30, 30, 30, 60, 60}, -3500000,  // entry 0 at -3.5 s
-         {{B, 5800000, 3000000}, {B, 2900000, 500000}, {F, 2900000, 3000000}, {F, 400000, 500000},
-          {B, -3300000, 0}, {F, -3300000, 0}}},
-        {{0, 0, 40, 40, 40, 45, 60, 70, 80, 90}, 2000000, {{F, 5500000, 6000000}, {B, 5500000, 4000000}}},
-        {std::vector<uint32_t>(10, 30), 0, {{B, 4550000, 3000000}, {F, 4550000, 4600000}}},  // F: by the search
+         {{B, 5800000, 3000000, 3000000}, {B, 2900000, 500000, 500000}, {F, 2900000, 3000000, 3000000},
+          {F, 400000, 500000, 500000}, {B, -3300000, 0, 0}, {F, -3300000, 0, 0}}},
+        {{0, 0, 40, 40, 40, 45, 60, 70, 80, 90}, 2000000,
+         {{F, 5500000, 6000000, 6000000}, {B, 5500000, 4000000, 4000000}}},
+        {std::vector<uint32_t>(10, 30), 0, {{B, 4550000, 3000000, 3000000}, {F, 4550000, 4600000, kFails}}},
+        // The last entry's key frame, worked out with the start offset: a
+        // forward seek onto it has no next entry to take.
+        {{0, 0, 0, 0, 0, 0, 0, 0, 0, 90}, 0, {{F, 9000000, 9000000, kFails}, {B, 9000000, 9000000, 9000000}}},
+        // Before the first key frame (at 0.5 s), on either side.
+        {{5, 10, 20, 30, 40, 50, 60, 70, 80, 90}, 0,
+         {{B, 499999, 500000, 500000}, {F, 499999, 500000, 500000}, {B, -10, 500000, 500000}}, 5},
     };
     for (const auto& c : cases)
-        for (const auto& [dir, target, found] : c.seeks) {
-            SCOPED_TRACE(testing::Message() << "dir " << dir << " target " << target);
-            Clip clip;
-            clip.key_every = 1, clip.entries = c.entries;
-            Player p(build(clip));
+        for (const auto& [dir, target, found, on_network] : c.seeks)
+            for (bool network : {false, true}) {
+                SCOPED_TRACE(testing::Message() << "dir " << dir << " target " << target << " network " << network);
+                Clip clip;
+                clip.key_every = 1, clip.key_first = c.key_first, clip.entries = c.entries;
+                host::InputOptions in;
+                in.streaming = network;
+                Player p(build(clip), in);
+                p.open_or_fail();
+                int64_t t = target;
+                const int64_t want = network ? on_network : found;
+                EXPECT_EQ(seek(p, int(dir), &t), want == kFails ? HOVA_SeekFailed : HOVA_OK);
+                EXPECT_EQ(p.ctx()->index_start_offset, c.start_offset);
+                ASSERT_EQ(p.play(), HOVA_EndOfStream);
+                const auto v = p.frames(kVideo);
+                EXPECT_EQ(v.empty() ? -1 : v.front().pts, want == kFails ? c.key_first * 100000ll : want);
+                if (want != kFails) {
+                    EXPECT_EQ(t, want);
+                }
+                p.expect_clean_close();
+            }
+}
+
+// An index naming packets in descending order over frames without the
+// key-frame bit: every probe finds nothing up to the end of the data. One
+// seek still reads each packet once, with the index held (5 460 entries) or
+// read entry by entry from the input.
+TEST(IndexSeek, ReadsEachPacketOnceWhateverTheIndexNames) {
+    for (uint32_t count : {5460u, 5461u})
+        for (int dir : {B, F}) {
+            SCOPED_TRACE(testing::Message() << count << " entries, dir " << dir);
+            Clip c;
+            c.packets = 546, c.key_first = c.packets;
+            std::vector<uint32_t> entries;
+            for (uint32_t i = 0; i < count; ++i) entries.push_back(i / 10 < c.packets ? c.packets - 1 - i / 10 : 0);
+            c.entries = entries;
+            host::InputOptions in;
+            in.disable_cache = true;  // the input sees every byte the seek reads
+            Player p(build(c), in);
             p.open_or_fail();
-            int64_t t = target;
-            ASSERT_EQ(seek(p, int(dir), &t), HOVA_OK);
-            EXPECT_EQ(t, found);
-            EXPECT_EQ(p.ctx()->index_start_offset, c.start_offset);
-            ASSERT_EQ(p.play(), HOVA_EndOfStream);
-            const auto v = p.frames(kVideo);
-            EXPECT_EQ(v.empty() ? -1 : v.front().pts, found);
+            const uint64_t before = p.input().counters().bytes_read;
+            int64_t t = 30000000;
+            EXPECT_EQ(seek(p, dir, &t), HOVA_SeekFailed);
+            EXPECT_LE(p.input().counters().bytes_read - before, 2 * (c.packets * 1024ull + count * 6ull));
             p.expect_clean_close();
         }
+}
+
+// After a seek the first video frame is the key frame the seek reported
+// (a seek to 0: the file's first key frame), though its packet also holds the
+// end of the group before it or earlier key frames: what comes before is
+// never handed to the host. In thumbnail mode the same; audio resumes with
+// the packet's first object start.
+TEST(SeekDelivery, FirstVideoFrameIsTheReportedKeyFrame) {
+    using asfb::Object;
+    std::vector<Object> one, gop;
+    for (uint32_t k = 0; k < 10; ++k) {  // one packet, key frames at 0, 120, 240 and 360 ms
+        one.push_back({1, 40 * k, asfb::pattern(50, k)});
+        one.push_back({2, 40 * k, asfb::pattern(100, 100 + k), k % 3 == 0});
+    }
+    for (uint32_t k = 0; k < 60; ++k) {  // key frames from 120 ms, every 400 ms
+        gop.push_back({1, 40 * k, asfb::pattern(40, k)});
+        gop.push_back({2, 40 * k, asfb::pattern(200 + 7 * (k % 5), 100 + k), k % 10 == 3});
+    }
+    const struct {
+        const char* name;
+        const std::vector<Object>* objects;
+        uint32_t packet_size;
+        std::vector<std::pair<int, int64_t>> seeks;
+    } shapes[] = {
+        {"one packet", &one, 8192, {{B, 250000}, {F, 130000}, {B, 120000}, {F, 0}}},
+        {"groups", &gop, 1024, {{B, 0}, {B, 100000}, {F, 520000}, {B, 520000}, {F, 900000}, {B, 1300000}, {B, 1700000}}},
+    };
+    for (const auto& sh : shapes) {
+        asfb::PacketFile f;
+        f.packet_size = sh.packet_size, f.packets = asfb::mux(*sh.objects, sh.packet_size);
+        const Bytes file = asfb::build_packet_file(f);
+        std::vector<asfb::Object> video, audio;
+        for (const auto& o : *sh.objects) (o.stream == 2 ? video : audio).push_back(o);
+        for (host::Buffering b : host::kBufferings)
+            for (int64_t thumbs : {-1ll, 200000ll})
+                for (const auto& [dir, target] : sh.seeks) {
+                    SCOPED_TRACE(testing::Message() << sh.name << ", " << host::buffering_name(b) << ", thumbnails "
+                                                    << thumbs << ", dir " << dir << ", target " << target);
+                    Player p(file, host::with_buffering(b));
+                    p.open_or_fail();
+                    hova_asff_demuxer.set_multi_thumb(p.ctx(), thumbs);
+                    for (int i = 0; i < 5; ++i) p.step();
+                    int64_t t = target;
+                    ASSERT_EQ(seek(p, dir, &t), HOVA_OK);
+                    const size_t from = p.host.events().size();
+                    ASSERT_EQ(p.play(), HOVA_EndOfStream);
+                    const auto& ev = p.host.events();
+                    const auto first = std::find_if(ev.begin() + long(from), ev.end(), [](const host::HostEvent& e) {
+                        return e.type == kVideo && !e.packet_type;
+                    });
+                    ASSERT_NE(first, ev.end());
+                    const auto key = std::find_if(video.begin(), video.end(), [&](const Object& o) {
+                        return o.key && (t == 0 || int64_t(o.pts_ms) * 1000 >= t);
+                    });
+                    ASSERT_NE(key, video.end());
+                    EXPECT_EQ(first->kind, EventKind::Commit);
+                    EXPECT_EQ(first->pts, int64_t(key->pts_ms) * 1000);
+                    EXPECT_EQ(first->crc32, delivery::crc(key->data));
+                    // Audio is not held back to the key frame.
+                    const Frames a = committed(p, kAudio, from, ev.size());
+                    ASSERT_FALSE(a.empty());
+                    EXPECT_LE(a.front().pts, first->pts);
+                    const auto in_file = std::find_if(audio.begin(), audio.end(), [&](const Object& o) {
+                        return int64_t(o.pts_ms) * 1000 == a.front().pts;
+                    });
+                    ASSERT_NE(in_file, audio.end());
+                    EXPECT_EQ(size_t(audio.end() - in_file) - 1, a.size());  // every later one, the last pending
+                    EXPECT_TRUE(sh.objects != &one || a.front().pts == 0);
+                    p.expect_clean_close();
+                }
+    }
 }
 
 // -1 only flushes the reader; any other time drops what delivery was
@@ -256,6 +378,15 @@ TEST(Resync, FlushOnlyForMinusOneOtherwiseRestartAtTheInputsPosition) {
                 ASSERT_EQ(p.play(), HOVA_EndOfStream);  // on at packet 40, whole frames only
                 const Frames v = committed(p, kVideo, from, p.host.events().size());
                 EXPECT_EQ(v.empty() ? -1 : v.front().pts, 4000000);
+                EXPECT_EQ(v.size(), 59u);
+                // The packets are where they were: a seek lands as without the resync.
+                int64_t t = 2350000;
+                const size_t at = p.host.events().size();
+                ASSERT_EQ(seek(p, B, &t), HOVA_OK);
+                EXPECT_EQ(t, 2000000);
+                ASSERT_EQ(p.play(), HOVA_EndOfStream);
+                const Frames w = committed(p, kVideo, at, p.host.events().size());
+                EXPECT_EQ(w.empty() ? -1 : w.front().pts, 2000000);
             }
             p.expect_clean_close();
         }

@@ -139,10 +139,15 @@ int check_drop(asf_demuxer_st* d, const asf_packet_st* p, const asf_stream_st* s
     if (type == HOVA_STREAM_AUDIO)
         return (accepted == HOVA_STREAM_NONE || accepted == HOVA_STREAM_AUDIO) ? 0 : 1;
     if (accepted != HOVA_STREAM_NONE && accepted != HOVA_STREAM_VIDEO) return 1;
-    if (d->seeked) {
-        // After open or a seek, video starts at the beginning of an object.
+    if (d->seeked != kAsfStartAnywhere) {
+        // After open video starts at the beginning of an object; after a
+        // seek at the key frame it reported. What comes before is passed
+        // over unread: the host sees neither a frame nor a discard.
         if (p->offset_into_obj != 0) return 1;
-        d->seeked = 0;
+        if (d->seeked == kAsfStartAtKeyFrame &&
+            (!(p->stream_num & 0x80) || asf_payload_pts(d, s, p->presentation_time) < d->s.seek_time))
+            return 1;
+        d->seeked = kAsfStartAnywhere;
     }
     return 0;
 }

@@ -37,6 +37,15 @@ void asf_convert_wchar_to_char(hova_string_info_st* string_info);
 int asf_read_cover(asf_demuxer_st* demuxer, uint32_t cover_length);
 int asf_skip_picture_header_and_get_size(uint8_t* input, uint32_t input_len);
 
+// Values of `seeked`: where video delivery may start after open or a seek.
+// After open, at the first payload that starts an object; after a seek, at
+// the first object start with the key-frame bit whose time is at or after
+// the time the seek reported (kept in s.seek_time), so that a decoder's first
+// picture has no missing reference.
+inline constexpr int kAsfStartAnywhere = 0;
+inline constexpr int kAsfStartAtObject = 1;
+inline constexpr int kAsfStartAtKeyFrame = 2;
+
 // Open and close helpers.
 void asf_free_memory(asf_demuxer_st* demuxer);
 void reset_data_packet(asf_packet_st* packet, uint64_t packet_num);

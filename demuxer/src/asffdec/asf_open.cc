@@ -1,5 +1,6 @@
 // Opening a file (context, reader, header, data object, simple index) and
 // closing it (every block back to the host, reader closed).
+#include <algorithm>
 #include <cstring>
 
 #include "asf_api.h"
@@ -161,7 +162,12 @@ extern "C" int asf_init_demuxer(void** ctx, cb_io_st* cbio, void* buffer, int bu
     d->cur_packets = 0;
     d->first_packet = static_cast<uint32_t>(cb_tell64(rd));
     const uint64_t data_size = load_le<uint64_t>(data_obj + asf::kObjSize);
-    if (d->num_packets == 0) d->num_packets = count_packets(d, data_size);
+    // The file properties' count is trusted only as far as the data object
+    // (when its size says nothing, the input) holds packets, and never past
+    // what a position in 63 bits can address: a hostile count would have
+    // seeks interpolate into packets that lie nowhere.
+    const uint64_t held = std::min(count_packets(d, data_size), asf_unbounded_packet_count(d));
+    if (d->num_packets == 0 || d->num_packets > held) d->num_packets = held;
     d->index_packet = 0;
     d->accept_stream_type = HOVA_STREAM_NONE;
     d->index_count = 0;

@@ -415,15 +415,38 @@ int64_t asf_realign_packet(asf_demuxer_st* d) {
             }
         }
     }
-    // The grid moves with the packets; a grid that would leave the 32-bit
-    // range stays where it is.
-    const int64_t shift = found == UINT64_MAX ? 0 : static_cast<int64_t>(found - grid);
-    const int64_t first = static_cast<int64_t>(d->first_packet) + shift;
-    if (found == UINT64_MAX || first < 0 || first > static_cast<int64_t>(UINT32_MAX)) {
+    auto keep = [&] {
         (void)cb->cb_seek64(cb, static_cast<cb_off_t>(pos), CB_SEEK_SET);
         return 0;
+    };
+    if (found == UINT64_MAX || found < d->first_packet) return keep();
+    const int64_t near = static_cast<int64_t>(found - grid);
+    if (near >= -kRealignReach && near <= kRealignReach) {
+        // Bytes gained or lost around the packet delivery expects: the grid
+        // follows them (and the packet count goes on, so delivery always
+        // moves on). A grid that would leave the 32-bit range stays.
+        const int64_t first = static_cast<int64_t>(d->first_packet) + near;
+        if (first < 0 || first > static_cast<int64_t>(UINT32_MAX)) return keep();
+        d->first_packet = static_cast<uint32_t>(first);
+    } else {
+        // Far from it (the host moved its input): a start a whole number of
+        // packets from the grid is on it, and delivery counts from that
+        // packet; one within reach of a slot moves the grid to it; any other
+        // leaves all as it was, as does a start behind the reader in a packet
+        // delivery has passed (reading it again could go on for ever).
+        const uint64_t off = (found - d->first_packet) % d->packet_size;
+        const int64_t shift = off <= d->packet_size - off ? static_cast<int64_t>(off)
+                                                           : -static_cast<int64_t>(d->packet_size - off);
+        const int64_t first = static_cast<int64_t>(d->first_packet) + shift;
+        if (shift > kRealignReach || shift < -kRealignReach || first < 0 ||
+            first > static_cast<int64_t>(UINT32_MAX))
+            return keep();
+        const uint64_t slot = (found - static_cast<uint64_t>(first)) / d->packet_size;
+        if (found < pos && slot < d->cur_packets) return keep();
+        d->first_packet = static_cast<uint32_t>(first);
+        d->cur_packets = slot;
+        p->num = slot;
     }
-    d->first_packet = static_cast<uint32_t>(first);
     (void)cb->cb_seek64(cb, static_cast<cb_off_t>(found), CB_SEEK_SET);
     return static_cast<int64_t>(found - pos);
 }

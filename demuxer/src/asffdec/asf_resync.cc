@@ -23,6 +23,9 @@ extern "C" int asf_resync_time(void* ctx, int64_t resync_time) {
     // A packet abandoned earlier would send delivery back to its position by
     // number; the input's new position is the one to read from.
     d->resync = 0;
+    // Video starts again at an object start, as after open; a seek's wait for
+    // its key frame (and that frame's time) does not hold at the new place.
+    d->seeked = kAsfStartAtObject;
     // The input moves by time and the reader adopts its position as one
     // step, so that a streaming thread cannot read in between.
     cb_seek_time_reset(cb, static_cast<int>(resync_time / 1000));

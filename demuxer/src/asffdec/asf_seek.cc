@@ -32,7 +32,9 @@ void position_separately(asf_demuxer_st* d, int dir, int64_t video_pts, uint64_t
     asf_stream_st* v = asf_active_stream(d, VID);
     int64_t audio_pts = video_pts;
     ASF_LOG("seek audio in separate mode\n");
-    const uint64_t audio_packet = asf_find_packet_with_type(d, dir, &audio_pts, HOVA_STREAM_AUDIO);
+    uint64_t barren = UINT64_MAX;  // what the video search learnt says nothing of audio
+    const uint64_t audio_packet =
+        asf_find_packet_with_type(d, dir, &audio_pts, HOVA_STREAM_AUDIO, &barren);
     if (audio_packet == kAsfNoPacket) {
         ASF_LOG("seek audio fails in separate mode, fall back to sequential mode\n");
         d->parse_mode = PARSE_SEQ;
@@ -55,7 +57,9 @@ void apply_position(asf_demuxer_st* d, uint64_t packet, int64_t pts) {
     d->cur_packets = packet;
     reset_data_packet(&d->cur_data_packet, packet);
     (void)asf_seek_to_packet_with_parsed(d, &d->cur_data_packet);
-    d->seeked = 1;
+    d->seeked = kAsfStartAtKeyFrame;
+    // A seek to 0 starts at the file's first key frame, whatever its time.
+    d->s.seek_time = pts == 0 ? INT64_MIN : pts;
     ASF_LOG("seek success, time %lld\n", static_cast<long long>(pts));
 }
 
@@ -82,13 +86,15 @@ extern "C" int asf_seek_time(void* ctx, int dir, int64_t* pts, int query_only) {
     }
 
     uint64_t packet = 0;
+    // Where no object start of the kind lies, as far as this seek found out.
+    uint64_t barren = UINT64_MAX;
     if (*pts != 0) {
         if (video) {
-            packet = asf_find_packet_by_index(d, dir, pts);
+            packet = asf_find_packet_by_index(d, dir, pts, &barren);
             if (packet == kAsfNoPacket && !d->s.streaming)
-                packet = asf_find_packet_with_type(d, dir, pts, HOVA_STREAM_VIDEO);
+                packet = asf_find_packet_with_type(d, dir, pts, HOVA_STREAM_VIDEO, &barren);
         } else {
-            packet = asf_find_packet_with_type(d, dir, pts, HOVA_STREAM_AUDIO);
+            packet = asf_find_packet_with_type(d, dir, pts, HOVA_STREAM_AUDIO, &barren);
         }
     }
     if (packet == kAsfNoPacket) {

@@ -26,13 +26,16 @@ void asf_release_index(asf_demuxer_st* d);
 
 // Packet of the video key frame for *pts through the simple index; *pts
 // becomes that key frame's time. kAsfNoPacket when the index cannot answer.
-uint64_t asf_find_packet_by_index(asf_demuxer_st* d, int dir, int64_t* pts);
+// *barren_from: the seek's bound of get_packet_pts_with_number.
+uint64_t asf_find_packet_by_index(asf_demuxer_st* d, int dir, int64_t* pts, uint64_t* barren_from);
 
-// Packet whose `target_type` object start is nearest *pts in direction `dir`,
-// found by interpolation and a packet scan; *pts becomes its time.
-// kAsfNoPacket when the search fails.
+// Packet whose `target_type` object start (for video, key frame) is nearest
+// *pts in direction `dir`, found by interpolation and a packet scan; *pts
+// becomes its time. Backward with none at or before *pts, the first one.
+// kAsfNoPacket when the search fails. *barren_from: the seek's bound for
+// this kind (none of its object starts from there on), kept up to date.
 uint64_t asf_find_packet_with_type(asf_demuxer_st* d, int dir, int64_t* pts,
-                                   hova_stream_type_et target_type);
+                                   hova_stream_type_et target_type, uint64_t* barren_from);
 
 // Gives back the host frames of partly assembled audio and video objects and
 // clears their assembly state.

@@ -51,16 +51,19 @@ size_t held_size(uint32_t count) {
 // depends only on the file and the active video stream, so with the index
 // held it is kept: a seek whose walk meets known entries costs only the
 // jump to its own packet. Failed probes are not kept (a read may fail once).
-int64_t entry_time(asf_demuxer_st* d, uint32_t i, uint32_t packet) {
+int64_t entry_time(asf_demuxer_st* d, uint32_t i, uint32_t packet, uint64_t* barren) {
+    // An entry the walk did not find names no packet: its kept time, if any,
+    // belongs to the entry it was left at, not to a packet.
+    if (packet == kNoEntry) return -1;
     int64_t* block = held_block(d);
-    if (!block) return get_packet_pts_with_number(d, packet);
+    if (!block) return get_packet_pts_with_number(d, packet, barren);
     int64_t* times = held_times(block);
     if (block[0] != d->s.active_stream[VID]) {
         for (uint32_t k = 0; k < d->index_count; ++k) times[k] = kUnprobed;
         block[0] = d->s.active_stream[VID];
     }
     if (times[i] != kUnprobed) return times[i];
-    const int64_t t = get_packet_pts_with_number(d, packet);
+    const int64_t t = get_packet_pts_with_number(d, packet, barren);
     if (t != -1) times[i] = t;
     return t;
 }
@@ -89,7 +92,8 @@ int64_t entry_time(asf_demuxer_st* d, uint32_t i, uint32_t packet) {
 
 // Moves *at to the nearest entry before (or after) it that names another
 // packet than `packet`; false at the end of the index or on a failed read.
-[[nodiscard]] bool neighbour_entry(asf_demuxer_st* d, bool before, uint32_t* at, uint32_t packet, IndexEntry* e) {
+[[nodiscard]] bool neighbour_entry(asf_demuxer_st* d, bool before, uint32_t* at, uint32_t packet,
+                                   IndexEntry* e) {
     do {
         if (before ? *at == 0 : *at + 1 >= d->index_count) return false;
         *at = before ? *at - 1 : *at + 1;
@@ -101,16 +105,17 @@ int64_t entry_time(asf_demuxer_st* d, uint32_t i, uint32_t packet) {
 // Entry 0 may stand for a time other than 0 (the first key frame rarely sits
 // at 0): the first entry naming another packet than entry 0 is probed and the
 // offset worked back from its time. False on a failed read of the index.
-bool compute_index_start_offset(asf_demuxer_st* d) {
+bool compute_index_start_offset(asf_demuxer_st* d, uint64_t* barren) {
     cb_buffer_st* cb = &d->s.cbuffer;
     if (!held_block(d) &&
         cb->cb_seek64(cb, static_cast<cb_off_t>(d->index_packet), CB_SEEK_SET) == -1)
         return false;
     d->index_start_offset = 0;
     uint32_t first = kNoEntry;
-    // A probe that found no key frame from packet p to the end of the data
-    // finds none from any later packet either: not worth walking again.
-    uint64_t barren_from = UINT64_MAX;
+    // A probe that found no key frame from packet p on lowers the bound: an
+    // entry at or after it is not probed, one before it walks only up to it,
+    // so an index naming packets in descending order costs one pass over the
+    // data, not one per entry.
     bool in_place = true;  // the reader stands on entry i
     for (uint32_t i = 0; i < d->index_count; ++i) {
         IndexEntry e;
@@ -120,13 +125,10 @@ bool compute_index_start_offset(asf_demuxer_st* d) {
             first = e.packet_number;
             continue;
         }
-        if (e.packet_number == first || e.packet_number >= barren_from) continue;
-        const int64_t t = entry_time(d, i, e.packet_number);
+        if (e.packet_number == first || e.packet_number >= *barren) continue;
+        const int64_t t = entry_time(d, i, e.packet_number, barren);
         in_place = false;
-        if (t == -1) {
-            barren_from = e.packet_number;
-            continue;
-        }
+        if (t == -1) continue;
         d->index_start_offset =
             static_cast<int64_t>(static_cast<uint64_t>(t) - uint64_t{i} * d->index_time_interval);
         ASF_LOG("index_start_offset %lld, preroll %u, first non-zero pts %lld, packet %u, index %d, "
@@ -173,9 +175,9 @@ void asf_release_index(asf_demuxer_st* d) {
     set_held_block(d, nullptr);
 }
 
-uint64_t asf_find_packet_by_index(asf_demuxer_st* d, int dir, int64_t* pts) {
+uint64_t asf_find_packet_by_index(asf_demuxer_st* d, int dir, int64_t* pts, uint64_t* barren) {
     if (d->index_packet == 0 || d->index_time_interval == 0) return kAsfNoPacket;
-    if (d->index_start_offset == -1 && !compute_index_start_offset(d)) return kAsfNoPacket;
+    if (d->index_start_offset == -1 && !compute_index_start_offset(d, barren)) return kAsfNoPacket;
 
     const int64_t target = *pts;
     // Worked out in 64 bits: a far target must not wrap back into the index.
@@ -209,7 +211,7 @@ uint64_t asf_find_packet_by_index(asf_demuxer_st* d, int dir, int64_t* pts) {
             ++index;
         }
         if (next.packet_number == kNoEntry || index > prev_index + 1) break;
-        const int64_t t = entry_time(d, next_at, next.packet_number);
+        const int64_t t = entry_time(d, next_at, next.packet_number, barren);
         if (t == -1) {
             next.packet_number = kNoEntry;
             break;
@@ -223,19 +225,27 @@ uint64_t asf_find_packet_by_index(asf_demuxer_st* d, int dir, int64_t* pts) {
     const bool back = dir == HOVA_SEEK_BACKWARD;
     uint32_t at = back ? pre_at : next_at;
     uint32_t packet = back ? pre.packet_number : next.packet_number;
-    int64_t t = entry_time(d, at, packet);
+    int64_t t = entry_time(d, at, packet, barren);
     if (t == -1) return kAsfNoPacket;
     // Entry 0's time is worked out from a key frame found at or after a later
     // entry's packet, which need not be that entry's own time: the walk may
     // end an entry off. Step entry by entry (over entries repeating the
     // packet) until the key frame lies on the asked side of the target.
+    // Going back past entry 0 there is no earlier key frame: entry 0's, the
+    // first one, is the answer (as the search without index answers).
     bool stepped = false;
     while (back ? t > target : t < target) {
         IndexEntry e;
-        if (!neighbour_entry(d, back, &at, packet, &e)) return kAsfNoPacket;
+        uint32_t from = at;
+        if (!neighbour_entry(d, back, &from, packet, &e)) {
+            if (back && from == 0) break;
+            return kAsfNoPacket;
+        }
+        const int64_t te = entry_time(d, from, e.packet_number, barren);
+        if (te == -1) return kAsfNoPacket;
+        at = from;
         packet = e.packet_number;
-        t = entry_time(d, at, packet);
-        if (t == -1) return kAsfNoPacket;
+        t = te;
         stepped = true;
     }
     // Going forward, the entries before the answer may name key frames after
@@ -244,7 +254,7 @@ uint64_t asf_find_packet_by_index(asf_demuxer_st* d, int dir, int64_t* pts) {
     for (uint32_t j = at; !back && !stepped;) {
         IndexEntry e;
         if (!neighbour_entry(d, true, &j, packet, &e)) break;
-        const int64_t tj = entry_time(d, j, e.packet_number);
+        const int64_t tj = entry_time(d, j, e.packet_number, barren);
         if (tj == -1 || tj <= target) break;
         at = j;
         packet = e.packet_number;

@@ -4,7 +4,10 @@
 // packet-by-packet scan, which walks forward until it has times on both
 // sides of the target, turning back to walk earlier packets when it first
 // meets a later time, or when it reaches the end without an answer on the
-// asked side.
+// asked side. A walk that meets nothing up to the end lowers the seek's
+// bound (see get_packet_pts_with_number), and no walk goes past the bound or
+// walks a packet of the scan twice: a seek reads each packet at most a few
+// times, however the times lie.
 #include "asf_seek.h"
 
 #include "asf_packet.h"
@@ -49,7 +52,7 @@ uint64_t interpolate(int64_t target, uint64_t lower, uint64_t upper, int64_t sta
 }  // namespace
 
 uint64_t asf_find_packet_with_type(asf_demuxer_st* d, int dir, int64_t* pts,
-                                   hova_stream_type_et target_type) {
+                                   hova_stream_type_et target_type, uint64_t* barren_from) {
     ASF_LOG("seek without index, type %d\n", static_cast<int>(target_type));
     // Without packets there is nothing to find (and no last packet to hold
     // a far target at).
@@ -64,27 +67,34 @@ uint64_t asf_find_packet_with_type(asf_demuxer_st* d, int dir, int64_t* pts,
     int narrowing = kNarrowingProbes;
     bool backward = false, got_forward = false, got_backward = false;
     Candidate prev, next;
+    auto end = [&] { return *barren_from < d->num_packets ? *barren_from : d->num_packets; };
 
     for (;;) {  // one interpolated positioning per pass
         if (start_time < stop_time)
             curr = interpolate(target, lower, upper, start_time, stop_time, d->num_packets);
         const uint64_t init = curr;
-        if (cb->cb_seek64(cb, static_cast<cb_off_t>(asf_packet_position(d, curr)), CB_SEEK_SET) == -1)
-            return kAsfNoPacket;
+        bool positioned = false, timed = false;
         asf_packet_st cursor{};
         for (;;) {  // one payload per step; leaving the loop starts the next pass
             int64_t t = -1;
-            const int r = get_packet_pts(d, &cursor, &t, target_type);
-            bool data_end = false;
-            if (r != HOVA_OK) {
-                // Where nothing counts the packets the input's end is the
-                // data's end; anything else ends the search.
-                if (r != HOVA_EndOfStream || cursor.num_payloads != 0 || !asf_packets_unbounded(d))
+            bool data_end = cursor.num_payloads == 0 && curr >= end();
+            if (!data_end) {
+                if (!positioned &&
+                    cb->cb_seek64(cb, static_cast<cb_off_t>(asf_packet_position(d, curr)), CB_SEEK_SET) == -1)
                     return kAsfNoPacket;
-                data_end = true;
+                positioned = true;
+                const int r = get_packet_pts(d, &cursor, &t, target_type);
+                if (r != HOVA_OK) {
+                    // Where nothing counts the packets the input's end is the
+                    // data's end; anything else ends the search.
+                    if (r != HOVA_EndOfStream || cursor.num_payloads != 0 || !asf_packets_unbounded(d))
+                        return kAsfNoPacket;
+                    data_end = true;
+                }
             }
             if (!data_end) {
                 if (t != -1) {
+                    timed = true;
                     if (single_probe) {
                         prev = next = {curr, t};
                         got_forward = got_backward = true;
@@ -108,7 +118,9 @@ uint64_t asf_find_packet_with_type(asf_demuxer_st* d, int dir, int64_t* pts,
                         prev = next = {curr, t};
                         got_forward = true;
                         goto finish;
-                    } else {
+                    } else if (!got_forward || t < next.pts) {
+                        // The earliest later time met is the forward answer
+                        // (and the first key frame, walking back to packet 0).
                         got_forward = true;
                         next = {curr, t};
                     }
@@ -118,34 +130,30 @@ uint64_t asf_find_packet_with_type(asf_demuxer_st* d, int dir, int64_t* pts,
                 if (cursor.num_payloads > 0) continue;
 
                 if (backward) {
-                    if (curr == 0) {
-                        prev = {0, 0};
-                        goto finish;
-                    }
+                    if (curr == 0) break;  // nothing earlier
                     --curr;
-                    (void)cb->cb_seek64(cb, -2 * static_cast<cb_off_t>(d->packet_size), CB_SEEK_CUR);
+                    positioned = false;
                     continue;
                 }
                 if (got_forward) {
-                    // A later time and no earlier one yet: walk back from the start.
+                    // A later time and no earlier one yet: walk back from
+                    // before the scan's start (walked already).
                     backward = true;
-                    curr = init;
-                    (void)cb->cb_seek64(cb, static_cast<cb_off_t>(asf_packet_position(d, curr)),
-                                        CB_SEEK_SET);
+                    if (init == 0) break;
+                    curr = init - 1;
+                    positioned = false;
                     continue;
                 }
-                if (++curr < d->num_packets) continue;
+                ++curr;
+                continue;
             }
 
-            // A walk ran off the end of the data (going back, only an input
-            // that ends before its packets do gets here).
-            if (backward) {
-                if (dir == HOVA_SEEK_FORWARD ? got_forward : got_backward) goto finish;
-                return kAsfNoPacket;
-            }
+            // A walk ran off the end of the data (or onto the bound).
+            if (!timed && !backward && init < *barren_from) *barren_from = init;
+            if (backward) break;
             if (narrowing > 0) {
                 // Nothing to find from this probe's start on: the range ends there.
-                upper = init;
+                upper = init < end() ? init : end();
                 curr = lower;
                 --narrowing;
                 break;
@@ -155,9 +163,19 @@ uint64_t asf_find_packet_with_type(asf_demuxer_st* d, int dir, int64_t* pts,
             // answer, if any, lies before it. Walk back from the start.
             backward = true;
             got_backward = false;
-            curr = init;
             cursor = asf_packet_st{};
-            (void)cb->cb_seek64(cb, static_cast<cb_off_t>(asf_packet_position(d, curr)), CB_SEEK_SET);
+            curr = init < end() ? init : end();
+            if (curr == 0) break;
+            --curr;
+            positioned = false;
+        }
+        if (backward) {
+            // Packet 0 (or the input's end) reached walking back.
+            if (dir == HOVA_SEEK_FORWARD ? got_forward : got_backward) goto finish;
+            if (dir == HOVA_SEEK_FORWARD || !got_forward) return kAsfNoPacket;
+            // Nothing at or before the target: the first one after it.
+            prev = next;
+            goto finish;
         }
     }
 

@@ -52,20 +52,25 @@ int get_packet_pts(asf_demuxer_st* d, asf_packet_st* cursor, int64_t* pts,
     return HOVA_OK;
 }
 
-int64_t get_packet_pts_with_number(asf_demuxer_st* d, uint32_t packet) {
+int64_t get_packet_pts_with_number(asf_demuxer_st* d, uint32_t packet, uint64_t* barren_from) {
     // Only key frames inside the data object count: packets past its end
     // (an index naming them, the bytes of the index itself) are not read.
-    if (packet >= d->num_packets) return -1;
+    const uint64_t end = *barren_from < d->num_packets ? *barren_from : d->num_packets;
+    if (packet >= end) return -1;
     cb_buffer_st* cb = &d->s.cbuffer;
-    const uint64_t data_end = asf_packet_position(d, d->num_packets);
+    const uint64_t stop = asf_packet_position(d, end);
     if (cb->cb_seek64(cb, static_cast<cb_off_t>(asf_packet_position(d, packet)), CB_SEEK_SET) == -1)
         return -1;
     asf_packet_st cursor{};
     for (;;) {
-        if (cursor.num_payloads == 0 && cb_tell64(cb) >= data_end) return -1;
+        if (cursor.num_payloads == 0 && cb_tell64(cb) >= stop) break;
         int64_t pts = -1;
         const int r = get_packet_pts(d, &cursor, &pts, HOVA_STREAM_VIDEO);
-        if (r == HOVA_EndOfStream) return -1;
+        if (r == HOVA_EndOfStream) break;
         if (r == HOVA_OK && pts != -1) return pts;
     }
+    // Nothing from here to the end (a read may fail once, but only within
+    // this seek is the answer kept).
+    *barren_from = packet;
+    return -1;
 }

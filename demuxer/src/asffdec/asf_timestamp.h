@@ -18,9 +18,12 @@ int get_packet_pts(asf_demuxer_st* d, asf_packet_st* cursor, int64_t* pts,
                    hova_stream_type_et target_type);
 
 // Time of the first video key-frame start at or after data packet `packet`,
-// or -1 when there is none inside the data object. The reader is left behind
-// the payload that gave the time.
-int64_t get_packet_pts_with_number(asf_demuxer_st* d, uint32_t packet);
+// or -1 when there is none before packet *barren_from (a seek's knowledge:
+// no key frame starts from there to the end of the data). A probe that finds
+// none lowers *barren_from to `packet`, so that no later probe of the same
+// seek walks those packets again. The reader is left behind the payload that
+// gave the time.
+int64_t get_packet_pts_with_number(asf_demuxer_st* d, uint32_t packet, uint64_t* barren_from);
 
 // File position of data packet `packet` (64-bit, no wrap).
 inline uint64_t asf_packet_position(const asf_demuxer_st* d, uint64_t packet) {
