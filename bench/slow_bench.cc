@@ -22,6 +22,7 @@
 //
 // usage: slow_bench [--corpus DIR] [--cache DIR] [--big FILE] [--speedup K]
 //                   [--only NAME] [--modes cache,none,ring,thread] [--no-big]
+//                   [--links M,M,...] (link rates as multiples of the bit rate)
 #include <time.h>
 
 #include <algorithm>
@@ -282,6 +283,7 @@ int main(int argc, char** argv) {
     std::string corpus = plimo_bench::default_corpus_dir();
     std::string cache = plimo_bench::default_cache_dir(), big, only;
     bool no_big = false;
+    std::vector<double> links;  // empty: 2, 4, 8 (1.25, 2, 4 for the large file)
     for (int i = 1; i < argc; ++i) {
         const std::string a = argv[i];
         if (i + 1 < argc && a == "--corpus") corpus = argv[++i];
@@ -290,6 +292,15 @@ int main(int argc, char** argv) {
         else if (i + 1 < argc && a == "--speedup") g_k = std::atof(argv[++i]);
         else if (i + 1 < argc && a == "--only") only = argv[++i];
         else if (a == "--no-big") no_big = true;
+        else if (i + 1 < argc && a == "--links") {
+            links.clear();
+            for (const char* p = argv[++i]; *p;) {
+                char* end = nullptr;
+                links.push_back(std::strtod(p, &end));
+                if (end == p) break;
+                p = *end == ',' ? end + 1 : end;
+            }
+        }
         else if (i + 1 < argc && a == "--modes") {
             g_modes.clear();
             const std::string list = argv[++i];
@@ -298,7 +309,7 @@ int main(int argc, char** argv) {
         } else {
             std::fprintf(stderr,
                          "usage: %s [--corpus DIR] [--cache DIR] [--big FILE] [--speedup K] [--only NAME] "
-                         "[--modes cache,none,ring,thread] [--no-big]\n",
+                         "[--modes cache,none,ring,thread] [--no-big] [--links M,M,...]\n",
                          argv[0]);
             return 2;
         }
@@ -311,11 +322,12 @@ int main(int argc, char** argv) {
     for (const std::string& path : plimo_bench::corpus_files(corpus)) {
         const std::string name = path.substr(path.find_last_of('/') + 1);
         if (!only.empty() && name.find(only) == std::string::npos) continue;
-        if (read_file(path, &file)) run_file(name, file, {2, 4, 8});
+        if (read_file(path, &file)) run_file(name, file, links.empty() ? std::vector<double>{2, 4, 8} : links);
     }
     if (no_big || (!only.empty() && std::string("big.wmv").find(only) == std::string::npos)) return 0;
     if (big.empty()) big = plimo_bench::big_file(cache);
-    if (!big.empty() && read_file(big, &file)) run_file("big.wmv", file, {1.25, 2, 4});
+    if (!big.empty() && read_file(big, &file))
+        run_file("big.wmv", file, links.empty() ? std::vector<double>{1.25, 2, 4} : links);
     else std::fprintf(stderr, "no large file (ffmpeg missing?); skipped\n");
     return 0;
 }
