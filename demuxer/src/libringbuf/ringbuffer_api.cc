@@ -416,7 +416,11 @@ int sys_ringbuffer_commit_locked(sys_ringbuffer* rb, uint32_t len) {
     if (rb->pwrite == rb->size) rb->pwrite = 0;
     store_cnt(rb, load_cnt(rb) + len);
     trim_history(rb);
-    if (rb->rsize_req != 0) pthread_cond_signal(&rb->ring_avail_cond);
+    // A waiting consumer is woken once what it asked for is there, not at
+    // every block: with small blocks each wake-up would be a hand-over of the
+    // lock for nothing (the end of the input wakes it separately).
+    if (rb->rsize_req > 0 && load_cnt(rb) >= static_cast<uint32_t>(rb->rsize_req))
+        pthread_cond_signal(&rb->ring_avail_cond);
     return 1;
 }
 
