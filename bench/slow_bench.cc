@@ -261,7 +261,7 @@ void run_file(const std::string& name, const Bytes& file, const std::vector<doub
             const PlayFigures a = play_fast(file, mode, link);
             const PlayFigures b = play_paced(file, mode, link);
             const SeekFigures s = seeks(file, mode, link, duration);
-            std::printf("| %.2gx | %s | %.0f ms | %.2f s | %.0f ms (%llu) | %d | %.0f ms | %d | %d of %d | ", m,
+            std::printf("| %.3gx | %s | %.0f ms | %.2f s | %.0f ms (%llu) | %d | %.0f ms | %d | %d of %d | ", m,
                         host::buffering_name(mode), read_ms, a.whole, a.slowest * 1000,
                         static_cast<unsigned long long>(a.slowest_reads), a.slow_calls,
                         b.slowest * 1000, b.slow_calls, b.late, b.frames);
