@@ -45,6 +45,8 @@ extern "C" {
 
 namespace {
 
+using plimo_bench::read_file;
+
 using Clock = std::chrono::steady_clock;
 using Bytes = std::vector<uint8_t>;
 
@@ -198,13 +200,6 @@ Result copy(const Bytes& file, Bytes& dst) {
 }
 
 // ---- inputs ----
-
-bool read_file(const std::string& path, Bytes* out) {
-    std::ifstream f(path, std::ios::binary);
-    if (!f) return false;
-    out->assign(std::istreambuf_iterator<char>(f), {});
-    return true;
-}
 
 std::string base_name(const std::string& p) { return p.substr(p.find_last_of('/') + 1); }
 

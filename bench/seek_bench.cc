@@ -37,6 +37,8 @@ extern "C" {
 
 namespace {
 
+using plimo_bench::read_file;
+
 using Clock = std::chrono::steady_clock;
 using Bytes = std::vector<uint8_t>;
 int g_block = 32768;
@@ -45,17 +47,6 @@ constexpr int kPasses = 3;
 
 using Mode = host::Buffering;
 constexpr auto& kModes = host::kBufferings;
-
-bool read_file(const std::string& path, Bytes* out) {
-    FILE* f = std::fopen(path.c_str(), "rb");
-    if (!f) return false;
-    std::fseek(f, 0, SEEK_END);
-    out->resize(static_cast<size_t>(std::ftell(f)));
-    std::fseek(f, 0, SEEK_SET);
-    const bool ok = std::fread(out->data(), 1, out->size(), f) == out->size();
-    std::fclose(f);
-    return ok;
-}
 
 // The file cut right after its data object (found by its GUID).
 Bytes without_index(const Bytes& file) {

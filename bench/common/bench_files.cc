@@ -54,4 +54,16 @@ std::vector<std::string> corpus_files(const std::string& dir) {
     return out;
 }
 
+bool read_file(const std::string& path, std::vector<uint8_t>* out) {
+    FILE* f = std::fopen(path.c_str(), "rb");
+    if (!f) return false;
+    std::fseek(f, 0, SEEK_END);
+    const long size = std::ftell(f);
+    std::fseek(f, 0, SEEK_SET);
+    out->resize(size > 0 ? static_cast<size_t>(size) : 0);
+    const bool ok = size >= 0 && std::fread(out->data(), 1, out->size(), f) == out->size();
+    std::fclose(f);
+    return ok;
+}
+
 }  // namespace plimo_bench

@@ -2,6 +2,7 @@
 // tree and the large WMV made there once with ffmpeg.
 #pragma once
 
+#include <cstdint>
 #include <string>
 #include <vector>
 
@@ -21,5 +22,8 @@ std::string default_corpus_dir();
 
 // The .asf, .wmv and .wma files of `dir`, sorted.
 std::vector<std::string> corpus_files(const std::string& dir);
+
+// The whole file into *out; false when it cannot be read.
+bool read_file(const std::string& path, std::vector<uint8_t>* out);
 
 }  // namespace plimo_bench

@@ -113,3 +113,32 @@ TEST(Ring, HistoryGivesBackReleasedBytesUntilTheProducerNeedsTheirRoom) {
     sys_ringbuffer_reset(&r.rb);
     EXPECT_EQ(sys_ringbuffer_history(&r.rb), 0u) << "a reset forgets the history";
 }
+
+TEST(Ring, AFillInFlightIsDroppedByAResetFlushOrClose) {
+    // The producer reserves room and fills it outside the lock; a reset,
+    // flush or close in between means its bytes were asked for before, so the
+    // commit stores nothing.
+    enum Action { None, Reset, Flush, Close };
+    for (Action action : {None, Reset, Flush, Close}) {
+        SCOPED_TRACE(action);
+        Ring r(16);
+        r.produce(10);
+        sys_ringbuffer_byte_release(&r.rb, 10);
+        pthread_mutex_lock(&r.rb.ring_mutex);
+        uint8_t* at = nullptr;
+        const uint32_t room = sys_ringbuffer_wspace_locked(&r.rb, 4, &at);
+        pthread_mutex_unlock(&r.rb.ring_mutex);
+        ASSERT_EQ(room, 4u);
+        std::fill_n(at, room, uint8_t{0xAB});
+        if (action == Reset) sys_ringbuffer_reset(&r.rb);
+        if (action == Flush) sys_ringbuffer_flush(&r.rb);
+        if (action == Close) sys_ringbuffer_close(&r.rb);
+        pthread_mutex_lock(&r.rb.ring_mutex);
+        const int stored = sys_ringbuffer_commit_locked(&r.rb, room);
+        pthread_mutex_unlock(&r.rb.ring_mutex);
+        EXPECT_EQ(stored, action == None ? 1 : 0);
+        EXPECT_EQ(sys_ringbuffer_avail(&r.rb), action == None ? 4 : 0);
+        EXPECT_EQ(r.rb.wlock, 0);
+        EXPECT_EQ(r.rb.rlock, 0);
+    }
+}

@@ -29,10 +29,18 @@ inline int16_t load_eos(const sys_ringbuffer* rb) {
     return __atomic_load_n(&rb->buf_eos, __ATOMIC_ACQUIRE);
 }
 
-// Bytes just written took room that the history may have counted on.
+// Bytes just written, or reserved for a fill in flight, took room that the
+// history may have counted on.
 void trim_history(sys_ringbuffer* rb) {
-    const uint32_t room = static_cast<uint32_t>(sys_ringbuffer_free_internal(rb));
+    const uint32_t free_room = static_cast<uint32_t>(sys_ringbuffer_free_internal(rb));
+    const uint32_t room = free_room > rb->filling ? free_room - rb->filling : 0;
     if (rb->hist > room) rb->hist = room;
+}
+
+// A reset, flush or close while a fill is in flight: its bytes were asked
+// for before, and the commit drops them.
+void drop_fill_in_flight(sys_ringbuffer* rb) {
+    if (rb->wlock) rb->rlock = 1;
 }
 
 void copy_in(sys_ringbuffer* rb, const uint8_t* src, uint32_t len) {
@@ -78,6 +86,9 @@ void sys_ringbuffer_init(sys_ringbuffer* rb, uint8_t* data, uint32_t len) {
     rb->taken = 0;
     rb->retry_read = 0;
     rb->unreleased = 0;
+    rb->filling = 0;
+    __atomic_store_n(&rb->source_waiters, 0, __ATOMIC_RELAXED);
+    pthread_mutex_init(&rb->source_mutex, nullptr);
     pthread_mutex_init(&rb->ring_mutex, nullptr);
     pthread_cond_init(&rb->ring_avail_cond, nullptr);
     pthread_cond_init(&rb->ring_free_cond, nullptr);
@@ -87,10 +98,30 @@ void sys_ringbuffer_destroy(sys_ringbuffer* rb) {
     pthread_cond_destroy(&rb->ring_avail_cond);
     pthread_cond_destroy(&rb->ring_free_cond);
     pthread_mutex_destroy(&rb->ring_mutex);
+    pthread_mutex_destroy(&rb->source_mutex);
+}
+
+void sys_ringbuffer_source_lock(sys_ringbuffer* rb) {
+    __atomic_add_fetch(&rb->source_waiters, 1, __ATOMIC_ACQ_REL);
+    pthread_mutex_lock(&rb->source_mutex);
+    __atomic_sub_fetch(&rb->source_waiters, 1, __ATOMIC_ACQ_REL);
+}
+
+void sys_ringbuffer_source_unlock(sys_ringbuffer* rb) {
+    pthread_mutex_unlock(&rb->source_mutex);
+    // A producer that stood back for us waits for room on this condition.
+    pthread_mutex_lock(&rb->ring_mutex);
+    pthread_cond_signal(&rb->ring_free_cond);
+    pthread_mutex_unlock(&rb->ring_mutex);
+}
+
+int sys_ringbuffer_source_wanted(const sys_ringbuffer* rb) {
+    return __atomic_load_n(&rb->source_waiters, __ATOMIC_ACQUIRE) != 0;
 }
 
 void sys_ringbuffer_close(sys_ringbuffer* rb) {
     pthread_mutex_lock(&rb->ring_mutex);
+    drop_fill_in_flight(rb);
     store_eos(rb, 1);
     store_cnt(rb, 0);
     rb->pread = rb->pwrite;
@@ -122,6 +153,7 @@ int32_t sys_ringbuffer_avail(sys_ringbuffer* rb) {
 
 void sys_ringbuffer_flush(sys_ringbuffer* rb) {
     pthread_mutex_lock(&rb->ring_mutex);
+    drop_fill_in_flight(rb);
     store_cnt(rb, 0);
     rb->error = 1;
     rb->pread = rb->pwrite;
@@ -133,6 +165,7 @@ void sys_ringbuffer_flush(sys_ringbuffer* rb) {
 }
 
 void sys_ringbuffer_reset_locked(sys_ringbuffer* rb) {
+    drop_fill_in_flight(rb);
     store_cnt(rb, 0);
     rb->pread = 0;
     rb->pwrite = 0;
@@ -364,18 +397,31 @@ uint32_t sys_ringbuffer_wspace_locked(sys_ringbuffer* rb, uint32_t len, uint8_t*
     if (room > to_end) room = to_end;
     if (room > len) room = len;
     *at = rb->data + rb->pwrite;
-    // The history must not count bytes the producer is about to overwrite.
-    const uint32_t left = static_cast<uint32_t>(sys_ringbuffer_free_internal(rb)) - room;
-    if (rb->hist > left) rb->hist = left;
+    // The history must not count bytes the producer is about to overwrite,
+    // now or (releases while the fill is out) until it commits.
+    rb->filling = room;
+    rb->wlock = 1;
+    rb->rlock = 0;
+    trim_history(rb);
     return room;
 }
 
-void sys_ringbuffer_commit_locked(sys_ringbuffer* rb, uint32_t len) {
+int sys_ringbuffer_commit_locked(sys_ringbuffer* rb, uint32_t len) {
+    const bool dropped = rb->rlock != 0;
+    rb->filling = 0;
+    rb->rlock = 0;
+    rb->wlock = 0;
+    if (dropped) return 0;
     rb->pwrite += len;
     if (rb->pwrite == rb->size) rb->pwrite = 0;
     store_cnt(rb, load_cnt(rb) + len);
     trim_history(rb);
-    if (rb->rsize_req != 0) pthread_cond_signal(&rb->ring_avail_cond);
+    // A waiting consumer is woken once what it asked for is there, not at
+    // every block: with small blocks each wake-up would be a hand-over of the
+    // lock for nothing (the end of the input wakes it separately).
+    if (rb->rsize_req > 0 && load_cnt(rb) >= static_cast<uint32_t>(rb->rsize_req))
+        pthread_cond_signal(&rb->ring_avail_cond);
+    return 1;
 }
 
 int sys_ringbuffer_rewind(sys_ringbuffer* rb, uint32_t len) {

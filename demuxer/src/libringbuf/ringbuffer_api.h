@@ -37,6 +37,13 @@ struct sys_ringbuffer {
                                 at the end of the input */
     uint32_t unreleased;     /* consumer only: bytes taken past pread without
                                 the lock, released later in a batch */
+    uint32_t filling;        /* room at pwrite the producer reserved and writes
+                                outside the lock (wlock set meanwhile) */
+    uint32_t source_waiters; /* callers waiting for source_mutex: the producer
+                                starts no new fill while there are any */
+    rb_mutex_t source_mutex; /* the producer's source: held by a fill from its
+                                reservation to its commit, and by whoever moves
+                                the source; taken before ring_mutex */
     rb_mutex_t ring_mutex;
     rb_cond_t ring_avail_cond;
     rb_cond_t ring_free_cond;
@@ -98,14 +105,26 @@ void sys_ringbuffer_settle_locked(sys_ringbuffer* rb);
 /* Both writes clear rlock and wlock: the producer's block is then stored or
  * dropped, no longer in flight. */
 
+/* The producer's source, for a producer that fills the ring outside
+ * ring_mutex: source_lock waits for the fill in flight (at most one: the
+ * producer starts none while someone waits), source_unlock wakes the producer
+ * again. Order: source_mutex before ring_mutex. */
+void sys_ringbuffer_source_lock(sys_ringbuffer* rb);
+void sys_ringbuffer_source_unlock(sys_ringbuffer* rb);
+/* Non-zero while a caller waits in source_lock. */
+int sys_ringbuffer_source_wanted(const sys_ringbuffer* rb);
+
 /* Internal forms for callers that already hold ring_mutex. */
 void sys_ringbuffer_reset_locked(sys_ringbuffer* rb);
 int32_t sys_ringbuffer_free_internal(const sys_ringbuffer* rb);
 int32_t sys_ringbuffer_avail_internal(const sys_ringbuffer* rb);
 /* In-place production without a staging copy: the free bytes that follow
  * pwrite without wrapping (at most `len`), at *at; then commit what was put
- * there. The history gives up the room the producer takes. */
+ * there. The history gives up the room the producer takes. The producer may
+ * drop ring_mutex in between and fill the room outside it: the room is its
+ * own until the commit. A reset, flush or close in between drops the fill
+ * (rlock): commit then stores nothing and returns 0, else 1. */
 uint32_t sys_ringbuffer_wspace_locked(sys_ringbuffer* rb, uint32_t len, uint8_t** at);
-void sys_ringbuffer_commit_locked(sys_ringbuffer* rb, uint32_t len);
+int sys_ringbuffer_commit_locked(sys_ringbuffer* rb, uint32_t len);
 
 #endif /* SYS_RINGBUFFER_API_H */

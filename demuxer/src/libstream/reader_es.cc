@@ -9,18 +9,21 @@ es_cbio_st* source_of(const cb_buffer_st* cb) { return static_cast<es_cbio_st*>(
 bool es_mode(const cb_buffer_st* cb) { return cb->input->rbuf_mode == CBIO_APPLY_ES_BUF; }
 
 // Has the host move its input by time (when asked and when it can), adopts
-// the input's position and empties the ring, all in one critical section: the
-// streaming thread reads the input only under this lock, so no block read
-// from the old position survives and none read from the new one is lost.
+// the input's position and empties the ring, all under the source lock: the
+// streaming thread reads the input and stores each block only under it, so
+// no block read from the old position survives and none read from the new
+// one is lost. The input calls stay outside ring_mutex.
 void reset_ring_at_input(cb_buffer_st* cb, bool move, int time_ms) {
     sys_ringbuffer* rb = cb->active_rbuf;
     cb_io_st* in = cb->input;
-    pthread_mutex_lock(&rb->ring_mutex);
+    sys_ringbuffer_source_lock(rb);
     if (move && in->seek_time) (void)in->seek_time(in, time_ms);
     cb->curpos = static_cast<cb_fpos>(in->tell(in));
+    pthread_mutex_lock(&rb->ring_mutex);
     sys_ringbuffer_reset_locked(rb);
     if (cb->base) end_hold_locked(cb);
     pthread_mutex_unlock(&rb->ring_mutex);
+    sys_ringbuffer_source_unlock(rb);
     if (cb->base) ring_side(cb)->active = ring_side(cb)->valid = ring_side(cb)->input_away = 0;
 }
 
@@ -93,7 +96,7 @@ int cb_set_buffer_mode(cb_buffer_st* cb, int enable) {
     const cb_off_t at = static_cast<cb_off_t>(cb->curpos);
     if (cb->active_rbuf) {
         // Stand the input where the caller stands and empty the ring together,
-        // under the lock the streaming thread reads the input with.
+        // under the source lock the streaming thread reads the input with.
         const cb_off_t r = reposition_ring_input(cb, at, CB_SEEK_SET);
         if (r == -1) return -1;
         cb->buffer_type = enable ? CB_STREAM_RBUF : CB_NO_BUF;

@@ -46,17 +46,19 @@ void init_multi_thread_plugin(cb_buffer_st* cb) {
 cb_off_t reposition_ring_input(cb_buffer_st* cb, cb_off_t target, int whence) {
     sys_ringbuffer* rb = cb->active_rbuf;
     cb_io_st* in = cb->input;
-    // One critical section for the input move and the emptying of the ring:
-    // the thread reads the input and stores what it read only under this
-    // lock, so every block is either wholly before this point (and emptied
-    // here) or wholly after it.
-    pthread_mutex_lock(&rb->ring_mutex);
+    // The input moves and the ring empties under the source lock, which the
+    // thread holds from each read to the store of its block: every block is
+    // either wholly before this point (and emptied here) or wholly after it.
+    // The move itself is outside ring_mutex, like every input call.
+    sys_ringbuffer_source_lock(rb);
     const cb_off_t r = in->seek(in, target, whence);
     if (r != -1) {
+        pthread_mutex_lock(&rb->ring_mutex);
         sys_ringbuffer_reset_locked(rb);
         if (cb->base) end_hold_locked(cb);
+        pthread_mutex_unlock(&rb->ring_mutex);
     }
-    pthread_mutex_unlock(&rb->ring_mutex);
+    sys_ringbuffer_source_unlock(rb);
     // A visit outside the ring ends with any move of the ring.
     if (r != -1 && cb->base) ring_side(cb)->active = ring_side(cb)->input_away = 0;
     return r;

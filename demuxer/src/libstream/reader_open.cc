@@ -69,6 +69,7 @@ int OpenURL(cb_buffer_st* cbuf, cb_io_st* input, int ringbuf_size, const hova_ca
         }
         cbuf->base = static_cast<uint8_t*>(host_alloc(cbs, base_bytes));
         if (cbuf->base) memset(cbuf->base, 0, CB_CACHE_HEAD);
+        if (cbuf->base && ring_wanted) ring_side(cbuf)->side_cap = block;
         bool ok = cbuf->base != nullptr;
         if (ok && ring_wanted) {
             cbuf->stream_ringbuf =

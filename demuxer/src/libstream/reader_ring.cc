@@ -27,7 +27,9 @@ void WriteData(cb_buffer_st* cb, uint32_t wanted) {
         s->input_away = 0;
     }
     for (;;) {
-        const int block = cb->input->block_size;
+        int block = cb->input->block_size;
+        // A host that raised block_size past the ring still gets whole-ring reads.
+        if (block > static_cast<int>(rb->size - 1)) block = static_cast<int>(rb->size - 1);
         if (block <= 0 || sys_ringbuffer_free_internal(rb) < block) break;
         uint8_t* at = nullptr;
         const uint32_t room = sys_ringbuffer_wspace_locked(rb, static_cast<uint32_t>(block), &at);

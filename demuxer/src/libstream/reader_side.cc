@@ -17,14 +17,25 @@ uint8_t* side_memory(const cb_buffer_st* cb) { return cb->base + CB_CACHE_HEAD; 
 
 cb_fpos side_end(const ring_side_st* s) { return s->side_pos + s->side_len; }
 
-// Locks the ring and settles it, so that what it holds is final, and gives
-// the position of the ring's first byte (kept aside while a visit is out).
+// Takes the input from the streaming thread (waiting for the read in flight,
+// if any) and settles the ring: with the source held nothing more is stored,
+// so what the ring holds is final until source_unlock. Gives the position of
+// the ring's first byte (kept aside while a visit is out).
 cb_fpos lock_for_visit(cb_buffer_st* cb) {
     const ring_side_st* s = ring_side(cb);
     const cb_fpos ring_pos = s->active ? s->ring_pos : cb->curpos;
-    pthread_mutex_lock(&cb->active_rbuf->ring_mutex);
-    sys_ringbuffer_settle_locked(cb->active_rbuf);
+    sys_ringbuffer_source_lock(cb->active_rbuf);
+    sys_ringbuffer_settle(cb->active_rbuf);
     return ring_pos;
+}
+
+// Bytes a visit reads: a block, but never more than the side block was
+// allocated with (the host may raise block_size after open).
+uint32_t side_read_len(const cb_buffer_st* cb) {
+    const int block = cb->input->block_size;
+    if (block <= 0) return 0;
+    const uint32_t cap = ring_side(cb)->side_cap;
+    return static_cast<uint32_t>(block) < cap ? static_cast<uint32_t>(block) : cap;
 }
 
 // The reader stands at `pos` in a visit; the side block holds `len` bytes
@@ -48,14 +59,16 @@ cb_off_t fetch_side(cb_buffer_st* cb, cb_fpos target) {
     // The way back below is the end of what the ring holds.
     const cb_fpos ring_pos = lock_for_visit(cb);
     if (in->seek(in, static_cast<cb_off_t>(target), CB_SEEK_SET) == -1) {
-        pthread_mutex_unlock(&rb->ring_mutex);
+        sys_ringbuffer_source_unlock(rb);
         return -1;
     }
-    const int block = in->block_size;
-    const size_t n = block > 0 ? in->read(in, side_memory(cb), static_cast<size_t>(block)) : 0;
+    const uint32_t asked = side_read_len(cb);
+    const size_t n = asked ? in->read(in, side_memory(cb), asked) : 0;
     cb_fpos back = ring_pos + rb_held(rb);
     s->input_away = 0;
-    if (in->seek(in, static_cast<cb_off_t>(back), CB_SEEK_SET) == -1) {
+    const bool back_refused = in->seek(in, static_cast<cb_off_t>(back), CB_SEEK_SET) == -1;
+    pthread_mutex_lock(&rb->ring_mutex);
+    if (back_refused) {
         // The input stays behind the side block: the ring starts there.
         back = target + n;
         sys_ringbuffer_reset_locked(rb);
@@ -69,7 +82,9 @@ cb_off_t fetch_side(cb_buffer_st* cb, cb_fpos target) {
         s->hold_ahead = 1;
     }
     pthread_mutex_unlock(&rb->ring_mutex);
+    sys_ringbuffer_source_unlock(rb);
     enter_visit(cb, target, static_cast<uint32_t>(n), 1);
+    s->side_short = n < asked;
     return static_cast<cb_off_t>(target);
 }
 
@@ -117,7 +132,7 @@ cb_off_t ring_seek_end(cb_buffer_st* cb, cb_off_t offset) {
         s->input_away = 1;
         s->input_back = ring_pos + rb_held(rb);
     }
-    pthread_mutex_unlock(&rb->ring_mutex);
+    sys_ringbuffer_source_unlock(rb);
     if (r == -1) return -1;
     // An empty visit: a read there moves the ring, a seek back finds it.
     s->ring_pos = ring_pos;
@@ -163,13 +178,13 @@ int32_t side_read(cb_buffer_st* cb, uint8_t* dst, int32_t size, bool* more) {
 int32_t side_peek(cb_buffer_st* cb, uint8_t* dst, int32_t size, bool* use_ring) {
     ring_side_st* s = ring_side(cb);
     *use_ring = false;
-    const int block = cb->input->block_size;
-    // A side block shorter than a block ends at the end of the input: a peek
-    // beyond it is short whatever reads it. (The empty visit of a seek from
-    // the end has read nothing: it says nothing about the end.)
-    const bool at_end = s->valid && block > 0 && s->side_len < static_cast<uint32_t>(block);
+    // A side block shorter than the read that filled it ends at the end of
+    // the input: a peek beyond it is short whatever reads it. (The empty
+    // visit of a seek from the end has read nothing: it says nothing about
+    // the end.)
+    const bool at_end = s->valid && s->side_short;
     if (cb->curpos + static_cast<uint32_t>(size) > side_end(s) && !at_end) {
-        if (size > block) {
+        if (static_cast<uint32_t>(size) > side_read_len(cb)) {
             // Larger than a side block: from the ring.
             if (reposition_ring_input(cb, static_cast<cb_off_t>(cb->curpos), CB_SEEK_SET) != -1) {
                 s->active = 0;

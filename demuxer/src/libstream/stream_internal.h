@@ -98,6 +98,8 @@ struct ring_side_st {
     // the ring since: the streaming thread reads no further ahead meanwhile.
     // Written under ring_mutex (the thread reads it there).
     int hold_ahead;
+    int side_short;     // the read that filled the side block came back short
+    uint32_t side_cap;  // bytes the side block was allocated with
 };
 ring_side_st* ring_side(const cb_buffer_st* cb);
 bool side_active(const cb_buffer_st* cb);

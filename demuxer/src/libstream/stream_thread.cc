@@ -46,62 +46,90 @@ uint32_t read_ahead_limit(const sys_ringbuffer* rb, uint32_t block) {
     return limit;
 }
 
+// One pass of the thread's loop, entered with both locks held (source, then
+// ring) and leaving both released: a wait, or one read and its store.
+void fill_once(cb_buffer_st* cb) {
+    sys_ringbuffer* rb = cb->srbuf;
+    cb_io_st* in = cb->input;
+    const int block_size = in->block_size;
+    const uint32_t cap = rb->size - 1;
+    uint32_t block = block_size > 0 ? static_cast<uint32_t>(block_size) : 1;
+    // A host that raised block_size past the ring still gets whole-ring reads.
+    if (block > cap) block = cap;
+    const uint32_t held = rb_held(rb);
+    const uint32_t room = static_cast<uint32_t>(sys_ringbuffer_free_internal(rb));
+    // A consumer waiting for more than is held gets the ring's whole room.
+    const bool starved = rb->rsize_req > 0 && static_cast<uint32_t>(rb->rsize_req) > held;
+    const uint32_t limit = read_ahead_limit(rb, block);
+    // Nothing ahead while a visit elsewhere has the input's transfer
+    // (until the consumer comes back to the ring or moves it).
+    const bool held_back = cb->base && ring_side(cb)->hold_ahead;
+    const bool want_more = starved || (!held_back && held + block <= limit);
+    const bool at_end = rb_eos(rb) && !rb->retry_read;
+    if (sys_ringbuffer_source_wanted(rb) || room < block || !want_more || at_end) {
+        // The input goes to whoever waits for it (a seek: it waits for at
+        // most the read that was in flight); the thread is woken when the
+        // input is free again, when the consumer has released enough (a
+        // whole block's room, and read-ahead below its limit), when it waits
+        // for data, when a seek empties the ring, or at the close. At the end
+        // of the input nothing comes until a seek or the close; an input
+        // that grows is read again after a short wait.
+        pthread_mutex_unlock(&rb->source_mutex);
+        if (at_end && !sys_ringbuffer_source_wanted(rb)) {
+            wait_for_wake(rb, kEndOfInputRetryNs);
+            rb->retry_read = 1;
+        } else {
+            rb->wsize_req = static_cast<int32_t>(want_more ? block : cap - limit + block);
+            wait_for_wake(rb);
+            rb->wsize_req = 0;
+        }
+        pthread_mutex_unlock(&rb->ring_mutex);
+        return;
+    }
+    rb->retry_read = 0;
+    // The read happens outside ring_mutex, into room the ring leaves to the
+    // thread until the commit: the consumer goes on taking what is held. The
+    // source lock keeps seeks, flushes and visits off the input meanwhile.
+    uint8_t* at = nullptr;
+    const uint32_t n_room = sys_ringbuffer_wspace_locked(rb, block, &at);
+    pthread_mutex_unlock(&rb->ring_mutex);
+    const size_t n = in->read(in, at, n_room);
+    pthread_mutex_lock(&rb->ring_mutex);
+    // Dropped when the ring was closed (or flushed) during the read.
+    if (sys_ringbuffer_commit_locked(rb, static_cast<uint32_t>(n))) {
+        if (n == 0) {
+            rb_set_eos(rb, 1);
+            if (rb->rsize_req) pthread_cond_signal(&rb->ring_avail_cond);
+        } else {
+            // More data after the end (growing input) reopens the stream.
+            rb_set_eos(rb, 0);
+            RecordWrite(at, static_cast<uint32_t>(n));
+        }
+    }
+    pthread_mutex_unlock(&rb->ring_mutex);
+    pthread_mutex_unlock(&rb->source_mutex);
+}
+
 }  // namespace
 
 void* StreamingData(void* arg) {
     cb_buffer_st* cb = static_cast<cb_buffer_st*>(arg);
     sys_ringbuffer* rb = cb->srbuf;
-    cb_io_st* in = cb->input;
-    // The input is read only under ring_mutex, the lock every seek holds
-    // while it moves the input and empties the ring, and each block goes
-    // into the ring in the same critical section as its read: no block read
-    // before a seek can be stored after it.
-    pthread_mutex_lock(&rb->ring_mutex);
+    // Everything that moves the input (seeks, the host's time moves, flushes,
+    // visits outside the ring) holds the source lock, and the thread holds
+    // it from choosing to read to storing what it read: a block is stored
+    // only if it was read from where the ring's bytes end. ring_mutex guards
+    // the ring's marks only, for short moments, never across a read.
     while (cb_state_load(cb) != STATE_STOP) {
-        const int block_size = in->block_size;
-        const uint32_t block = block_size > 0 ? static_cast<uint32_t>(block_size) : 1;
-        const uint32_t held = rb_held(rb);
-        const uint32_t room = static_cast<uint32_t>(sys_ringbuffer_free_internal(rb));
-        // A consumer waiting for more than is held gets the ring's whole room.
-        const bool starved = rb->rsize_req > 0 && static_cast<uint32_t>(rb->rsize_req) > held;
-        const uint32_t limit = read_ahead_limit(rb, block);
-        // Nothing ahead while a visit elsewhere has the input's transfer
-        // (until the consumer comes back to the ring or moves it).
-        const bool held_back = cb->base && ring_side(cb)->hold_ahead;
-        const bool want_more = starved || (!held_back && held + block <= limit);
-        if (room < block || !want_more) {
-            // Woken when the consumer has released enough (a whole block's
-            // room, and read-ahead below its limit), when it waits for data,
-            // when a seek empties the ring, or at the close.
-            const uint32_t cap = rb->size - 1;
-            const uint32_t need = want_more ? block : cap - limit + block;
-            rb->wsize_req = static_cast<int32_t>(need);
-            wait_for_wake(rb);
-            rb->wsize_req = 0;
-            continue;
+        pthread_mutex_lock(&rb->source_mutex);
+        pthread_mutex_lock(&rb->ring_mutex);
+        if (cb_state_load(cb) == STATE_STOP) {
+            pthread_mutex_unlock(&rb->ring_mutex);
+            pthread_mutex_unlock(&rb->source_mutex);
+            break;
         }
-        if (rb_eos(rb) && !rb->retry_read) {
-            // Nothing more until a seek or the close; an input that grows
-            // is read again after a short wait.
-            wait_for_wake(rb, kEndOfInputRetryNs);
-            rb->retry_read = 1;
-            continue;
-        }
-        rb->retry_read = 0;
-        uint8_t* at = nullptr;
-        const uint32_t n_room = sys_ringbuffer_wspace_locked(rb, block, &at);
-        const size_t n = in->read(in, at, n_room);
-        if (n == 0) {
-            rb_set_eos(rb, 1);
-            if (rb->rsize_req) pthread_cond_signal(&rb->ring_avail_cond);
-            continue;
-        }
-        // More data after the end (growing input) reopens the stream.
-        rb_set_eos(rb, 0);
-        RecordWrite(at, static_cast<uint32_t>(n));
-        sys_ringbuffer_commit_locked(rb, static_cast<uint32_t>(n));
+        fill_once(cb);
     }
-    pthread_mutex_unlock(&rb->ring_mutex);
     return nullptr;
 }
 
