@@ -36,13 +36,9 @@ constexpr uint64_t kHostilePacketCount = 18374686479671623794ull;
 
 // Sets the file properties' packet count; false when the file has none.
 bool set_packet_count(Bytes& file, uint64_t count) {
-    static const uint8_t kFileProperties[16] = {0xA1, 0xDC, 0xAB, 0x8C, 0x47, 0xA9, 0xCF, 0x11,
-                                                0x8E, 0xE4, 0x00, 0xC0, 0x0C, 0x20, 0x53, 0x65};
-    const auto at = std::search(file.begin(), file.end(), std::begin(kFileProperties), std::end(kFileProperties));
-    const size_t field = size_t(at - file.begin()) + 24 + 16 + 8 + 8;  // behind file id, size, creation date
-    if (at == file.end() || field + 8 > file.size()) return false;
-    for (int i = 0; i < 8; ++i) file[field + size_t(i)] = uint8_t(count >> (8 * i));
-    return true;
+    const size_t body = asfb::file_properties_body(file);
+    for (int i = 0; body && i < 8; ++i) file[body + 32 + size_t(i)] = uint8_t(count >> (8 * i));
+    return body != 0;
 }
 
 TEST(Regress, FuzzFindingsReplayCleanly) {

@@ -1,5 +1,6 @@
 #include "asf_builder.h"
 
+#include <algorithm>
 #include <cstdio>
 #include <stdexcept>
 
@@ -168,6 +169,12 @@ File standard_file(bool audio, bool video, uint32_t packets) {
         f.trailing.push_back(simple_index(10000000, entries));
     }
     return f;
+}
+
+size_t file_properties_body(const Bytes& file) {
+    const Bytes id = Writer().guid(asf_file_prop_object).out;
+    const auto at = std::search(file.begin(), file.end(), id.begin(), id.end());
+    return size_t(file.end() - at) < 24 + 80 ? 0 : size_t(at - file.begin()) + 24;
 }
 
 }  // namespace asfb

@@ -109,6 +109,9 @@ struct File {
     std::vector<Bytes> header_children, packets, trailing; Size data_object_size;  // declared; default: real
 };
 Bytes build(const File& f);
+// Where the body of the first file properties object of `file` starts; 0
+// when there is none (or it is cut short).
+size_t file_properties_body(const Bytes& file);
 
 // The usual shape: file properties, a WMA2 stream 1 and/or a WMV3 stream 2,
 // `packets` zero-filled packets and a simple index when there is video.

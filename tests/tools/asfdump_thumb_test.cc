@@ -5,24 +5,20 @@
 // was built without libavcodec.
 #include <gtest/gtest.h>
 
-#include <unistd.h>
-
 #include <cmath>
-#include <cstdio>
-#include <fstream>
-#include <nlohmann/json.hpp>
-#include <sstream>
 
-#include "test_env.h"
+#include "asfdump_cli.h"
 
 namespace {
 
-using nlohmann::json;
+using cli::json;
+using cli::quoted;
 
-std::string quote(const std::string& s) { return "'" + s + "'"; }
-
+// asfdump's exit status, with what it said on stdout and stderr in `out`.
 int asfdump(const std::string& args, std::string* out) {
-    return testenv::run_command(testenv::asfdump_path() + " " + args + " 2>&1", out);
+    const cli::Result r = cli::asfdump(args);
+    *out = r.out + r.err;
+    return r.status;
 }
 
 // Skips the test unless ffmpeg is installed and asfdump can decode pictures.
@@ -62,13 +58,7 @@ std::pair<int, int> png_size(const std::string& path) {
 
 // Times of the video frames `asfdump frames FILE ARGS` delivers.
 std::vector<int64_t> video_times(const std::string& file, const std::string& args) {
-    std::string out;
-    testenv::run_command(testenv::asfdump_path() + " frames " + quote(file) + " --no-audio " + args + " 2>/dev/null", &out);
-    std::vector<int64_t> times;
-    std::istringstream lines(out);
-    for (std::string line; std::getline(lines, line);)
-        if (const json e = json::parse(line); e["event"] == "frame") times.push_back(e["pts"]);
-    return times;
+    return cli::frame_times(cli::json_lines("frames " + quoted(file) + " --no-audio " + args));
 }
 
 std::string temp_png(const std::string& name) {
@@ -102,22 +92,22 @@ TEST(AsfdumpThumb, PicturesAreFfmpegsFromStartToEndOfEveryVideoFile) {
     int checked = 0;
     for (const std::string& file : testenv::corpus_files()) {
         std::string out;
-        if (asfdump("info " + quote(file), &out) != 0) continue;  // a damaged file that does not open
+        if (asfdump("info " + quoted(file), &out) != 0) continue;  // a damaged file that does not open
         const json info = json::parse(out);
         const std::string png = temp_png("at");
         if (info["active_video"].is_null()) {
-            EXPECT_EQ(asfdump("thumb " + quote(file) + " --at 1s -o " + png, &out), 2) << file;
+            EXPECT_EQ(asfdump("thumb " + quoted(file) + " --at 1s -o " + png, &out), 2) << file;
             EXPECT_NE(out.find("has no video stream (audio only)"), std::string::npos) << out;
             continue;
         }
         const std::vector<int64_t> times = video_times(file, "");
         if (times.empty()) {
             // The single frame of a one-frame stream stays pending at the end of the data.
-            EXPECT_EQ(asfdump("thumb " + quote(file) + " --at 0 -o " + png, &out), 1) << file;
+            EXPECT_EQ(asfdump("thumb " + quoted(file) + " --at 0 -o " + png, &out), 1) << file;
             EXPECT_NE(out.find("no picture at or after 0:00:00.000"), std::string::npos) << out;
             continue;
         }
-        const json ffprobe = json::parse(std::ifstream(file + ".ffprobe.json"));
+        const json ffprobe = cli::ffprobe(file);
         // Half a frame past the last delivered frame: the VC-1 decoder holds
         // its last picture back until the end, then it still has one; other
         // decoders have none left (the file's last frame stays pending).
@@ -126,7 +116,7 @@ TEST(AsfdumpThumb, PicturesAreFfmpegsFromStartToEndOfEveryVideoFile) {
         const bool held_back = codec == "WVC1" || codec == "WMVA";
         for (const int64_t t : {times.front(), times[times.size() / 2], times.back(), past}) {
             const std::string where = file + " at " + std::to_string(t) + " us";
-            const int rc = asfdump("thumb " + quote(file) + " --at " + std::to_string(t) + " -o " + png, &out);
+            const int rc = asfdump("thumb " + quoted(file) + " --at " + std::to_string(t) + " -o " + png, &out);
             if (t == past && !held_back) {
                 EXPECT_EQ(rc, 1) << where << ": " << out;
                 continue;
@@ -138,7 +128,7 @@ TEST(AsfdumpThumb, PicturesAreFfmpegsFromStartToEndOfEveryVideoFile) {
             char ss[32];
             std::snprintf(ss, sizeof ss, "%.6f", static_cast<double>(t) / 1e6);
             const double db = psnr(rgb("-i " + png), rgb("-seek_timestamp 1 -ss " + std::string(ss) + " -i " +
-                                                        quote(file) + " -map 0:v:0"));
+                                                        quoted(file) + " -map 0:v:0"));
             if (merged_before(ffprobe, times, t))
                 std::printf("%s: frames merged by compressed payloads before it: PSNR %.1f dB, not compared\n",
                             where.c_str(), db);
@@ -156,7 +146,7 @@ TEST(AsfdumpThumb, SheetHasATilePerThumbnailKeyFrameEachThePictureAtItsTime) {
     REQUIRE_CORPUS_FILE(file, "moon-elephants-dream-first-minute.wmv");
     const std::string sheet = temp_png("sheet"), one = temp_png("one");
     std::string out;
-    ASSERT_EQ(asfdump("thumb " + quote(file) + " --every 5s --sheet " + sheet + " --width 160 --columns 3", &out), 0)
+    ASSERT_EQ(asfdump("thumb " + quoted(file) + " --every 5s --sheet " + sheet + " --width 160 --columns 3", &out), 0)
         << out;
     const std::vector<int64_t> keys = video_times(file, "--thumbnail 5000000");
     const std::string sheet_rgb = rgb("-i " + sheet);
@@ -170,7 +160,7 @@ TEST(AsfdumpThumb, SheetHasATilePerThumbnailKeyFrameEachThePictureAtItsTime) {
         const int64_t t = ((h * 60 + m) * 60 + s) * 1000000LL + ms * 1000LL;
         ASSERT_LT(n, keys.size()) << line;
         EXPECT_EQ(t, keys[n]) << line;
-        ASSERT_EQ(asfdump("thumb " + quote(file) + " --at " + std::to_string(t) + " --width 160 -o " + one, &out), 0)
+        ASSERT_EQ(asfdump("thumb " + quoted(file) + " --at " + std::to_string(t) + " --width 160 -o " + one, &out), 0)
             << out;
         const std::string want = rgb("-i " + one);
         std::string tile;
@@ -201,11 +191,11 @@ TEST(AsfdumpThumb, RefusesWhatItCannotDo) {
     };
     for (const auto& [args, said] : cases) {
         std::string out;
-        EXPECT_EQ(asfdump("thumb " + quote(file) + " " + args, &out), 2) << args;
+        EXPECT_EQ(asfdump("thumb " + quoted(file) + " " + args, &out), 2) << args;
         EXPECT_NE(out.find(said), std::string::npos) << args << ": " << out;
     }
     std::string out;
-    EXPECT_EQ(asfdump("thumb " + quote(file) + " --at 1:00 -o " + png, &out), 1);
+    EXPECT_EQ(asfdump("thumb " + quoted(file) + " --at 1:00 -o " + png, &out), 1);
     EXPECT_NE(out.find("no picture at or after 0:01:00.000"), std::string::npos) << out;
     EXPECT_NE(access(png.c_str(), F_OK), 0) << "nothing written";
 }

@@ -1,9 +1,10 @@
-// asfdump stats against ffprobe's packet lists: per stream the frame count,
-// first and last time, largest gap, the key frames (found through thumbnail
-// mode) and the simple index checked by seeking.
+// asfdump frames and stats against ffprobe's packet lists: frames with
+// ffprobe's times, sizes and CRC-32s and play options that cut the list
+// short; per stream the frame count, first and last time, largest gap, the
+// key frames (found through thumbnail mode) and the simple index checked by
+// seeking.
 #include <gtest/gtest.h>
 
-#include <nlohmann/json.hpp>
 #include <regex>
 #include <set>
 
@@ -12,7 +13,23 @@
 
 namespace {
 
-using nlohmann::json;
+using cli::json;
+
+TEST(AsfdumpFrames, PrintsTheHostsEventsAsTheContractSays) {
+    REQUIRE_CORPUS_FILE(path, "moon-timecode-short.wmv");  // one WMV2 stream, no compressed payloads
+    const std::vector<json> packets = cli::delivered_packets(cli::ffprobe(path))["video"];
+    const std::vector<json> all = cli::json_lines("frames " + cli::quoted(path));
+    ASSERT_EQ(cli::frame_times(all).size(), packets.size());
+    EXPECT_EQ(json({all[0]["event"], all[0]["codec_name"]}), json({"config", "WMV2"}));
+    for (size_t i = 1; i <= packets.size(); ++i)
+        EXPECT_EQ(json({all[i]["pts"], all[i]["size"], all[i]["crc32"]}),
+                  json({packets[i - 1]["pts_ms"].get<int64_t>() * 1000, packets[i - 1]["size"], packets[i - 1]["crc32"]})) << i;
+    for (const auto& [args, want] : {std::pair{"", packets.size()}, {"--max-frames 5", 5ul}, {"--no-video --buffer ring --thread", 0ul}}) {
+        const std::vector<json> events = cli::json_lines("frames " + cli::quoted(path) + " " + args);
+        EXPECT_EQ(cli::frame_times(events).size(), want) << args;
+        EXPECT_EQ(json({events.back()["event"], events.back()["blocks_outstanding"]}), json({"end", 0})) << args;
+    }
+}
 
 int64_t us(const std::string& text) {
     int64_t v = -1;
@@ -31,13 +48,7 @@ TEST(AsfdumpStats, AgreesWithFfprobesPackets) {
     for (const auto& [name, index_clean] : files) {
         const std::string path = testenv::corpus_file(name);
         if (path.empty()) continue;
-        const json ref = json::parse(std::ifstream(path + ".ffprobe.json"));
-        std::map<std::string, std::vector<const json*>> packets;  // by type, file order
-        std::map<int, std::string> type;
-        for (const json& st : ref["streams"]) type[st["index"]] = st["codec_type"];
-        for (const json& p : ref["packets"]) packets[type[p["stream"]]].push_back(&p);
-        for (auto& [t, list] : packets) list.pop_back();  // the last object of each stream stays pending
-
+        auto packets = cli::delivered_packets(cli::ffprobe(path));
         const cli::Result r = cli::asfdump("stats " + cli::quoted(path));
         ASSERT_EQ(r.status, 0) << r.err;
         std::istringstream lines(r.out);
@@ -48,7 +59,7 @@ TEST(AsfdumpStats, AgreesWithFfprobesPackets) {
                 ++tracks;
                 const auto& list = packets[m[1]];
                 std::vector<int64_t> pts;
-                for (const json* p : list) pts.push_back((*p)["pts_ms"].get<int64_t>() * 1000);
+                for (const json& p : list) pts.push_back(p["pts_ms"].get<int64_t>() * 1000);
                 std::sort(pts.begin(), pts.end());
                 int64_t gap = 0;
                 for (size_t i = 1; i < pts.size(); ++i) gap = std::max(gap, pts[i] - pts[i - 1]);
@@ -56,8 +67,8 @@ TEST(AsfdumpStats, AgreesWithFfprobesPackets) {
                 EXPECT_EQ(json({us(m[3]), us(m[4]), us(m[5])}), json({pts.front(), pts.back(), gap})) << line;
             } else if (std::regex_match(line, m, keys)) {
                 std::set<int64_t> want;
-                for (const json* p : packets["video"])
-                    if ((*p)["key"] == true || (*p)["key"] == 1) want.insert((*p)["pts_ms"].get<int64_t>());
+                for (const json& p : packets["video"])
+                    if (p["key"] == true || p["key"] == 1) want.insert(p["pts_ms"].get<int64_t>());
                 EXPECT_EQ(std::stoul(m[1]), want.size()) << name;
             } else if (std::regex_match(line, m, index)) {
                 EXPECT_GT(std::stoi(m[1]), 0) << line;
