@@ -193,7 +193,8 @@ INSTANTIATE_TEST_SUITE_P(Corpus, CorpusDelivery, testing::ValuesIn(corpus_names(
 // backward seek finds lies between the two), else it fails; a network input
 // fails only where the index cannot answer (no index, or a forward target in
 // its last entry's interval). Delivery then hands over that key frame byte
-// for byte as its first video frame (audio: among its first frames), every
+// for byte as its first video frame (audio: among its first frames), also when
+// the host moved its input and resynchronised before every third seek; every
 // frame of the kind has a reference time, and in separate parsing the other
 // stream resumes too.
 TEST(CorpusSeek, SweepLandsOnTheAskedSideAndDeliversTheKeyFrame) {
@@ -243,6 +244,13 @@ TEST(CorpusSeek, SweepLandsOnTheAskedSideAndDeliversTheKeyFrame) {
                         while (mode & 2 && p.ctx()->parse_mode != PARSE_SEP && p.step() != HOVA_EndOfStream) {}
                         const bool sep = p.ctx()->parse_mode == PARSE_SEP;
                         separate += sep;
+                        if (k % 3 == 2 && p.ctx()->num_packets > 0) {  // the host first moves to a packet of its own
+                            const asf_demuxer_st* c = p.ctx();
+                            const uint64_t to = c->first_packet + uint64_t(c->packet_size) * (k * 7 % c->num_packets);
+                            p.s.input().time_to_position = [to](int) { return int64_t(to); };
+                            ASSERT_EQ(hova_asff_demuxer.resync_time(p.ctx(), target), HOVA_OK);
+                            for (int i = 0; i < 3; ++i) p.step();
+                        }
                         const size_t from = p.cb().events().size();
                         int64_t found = target;
                         const int rc = p.seek(dir, &found);
