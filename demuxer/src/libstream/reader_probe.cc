@@ -1,0 +1,148 @@
+// Probes: while a search parses a few bytes here and there (the search
+// without index steps back over thousands of packets, reading a header in
+// each), reads go straight to the input and read only what is asked. A
+// buffered read there would fetch a whole block that starts at each packet,
+// to use a few dozen bytes of it. What the buffers hold, where the reader
+// stands and where the input stands for them are put back at the end, so
+// delivery afterwards reads as it would have without the probes.
+#include "stream_internal.h"
+
+namespace {
+
+// The input to the probe position; false when it refuses.
+bool input_to_curpos(cb_buffer_st* cb) {
+    cb_io_st* in = cb->input;
+    const cb_off_t at = static_cast<cb_off_t>(cb->curpos);
+    return in->tell(in) == at || in->seek(in, at, CB_SEEK_SET) == at;
+}
+
+int32_t probe_read(cb_buffer_st* cb, uint8_t* dst, int32_t size, bool advance) {
+    if (size <= 0) {
+        cb->cb_errcode = CB_ERR_OK;
+        return 0;
+    }
+    size_t n = 0;
+    if (input_to_curpos(cb)) {
+        if (dst) {
+            n = cb->input->read(cb->input, dst, static_cast<size_t>(size));
+        } else {
+            // A read that keeps nothing is a skip.
+            n = static_cast<size_t>(size);
+            if (!advance) n = 0;
+        }
+    }
+    cb->cb_errcode = n < static_cast<size_t>(size) ? CB_ERR_EOF : CB_ERR_OK;
+    if (advance) cb->curpos += n;
+    return static_cast<int32_t>(n);
+}
+
+int32_t probe_read_op(cb_buffer_st* cb, uint8_t* dst, int32_t size) { return probe_read(cb, dst, size, true); }
+int32_t probe_peek_op(cb_buffer_st* cb, uint8_t* dst, int32_t size) { return probe_read(cb, dst, size, false); }
+
+cb_off_t probe_seek64_op(cb_buffer_st* cb, cb_off_t offset, int whence) {
+    cb_io_st* in = cb->input;
+    cb_off_t target = 0;
+    switch (whence) {
+        case CB_SEEK_SET:
+            target = offset;
+            break;
+        case CB_SEEK_CUR:
+            // Moving on inside what is being parsed: the next read places the input.
+            target = static_cast<cb_off_t>(cb->curpos) + offset;
+            if (target < 0) return -1;
+            cb->curpos = static_cast<cb_fpos>(target);
+            return target;
+        case CB_SEEK_END:
+            target = in->seek(in, offset, CB_SEEK_END);
+            if (target == -1) return -1;
+            cb->curpos = static_cast<cb_fpos>(target);
+            return target;
+        default:
+            return -1;
+    }
+    // A new place: the input says whether it can go there, as it would for a
+    // seek outside the buffer.
+    if (target < 0 || in->seek(in, target, CB_SEEK_SET) == -1) return -1;
+    cb->curpos = static_cast<cb_fpos>(target);
+    return target;
+}
+
+int32_t probe_seek_op(cb_buffer_st* cb, int32_t offset, int whence) {
+    return static_cast<int32_t>(
+        static_cast<uint32_t>(probe_seek64_op(cb, static_cast<cb_off_t>(offset), whence)));
+}
+
+// Where the buffering expects the input to stand: the end of what the ring
+// holds (the ring's read position while a visit is out is kept aside).
+cb_fpos ring_input_end(const cb_buffer_st* cb) {
+    const ring_side_st* s = ring_side(cb);
+    const cb_fpos ring_pos = s->active ? s->ring_pos : cb->curpos;
+    return ring_pos + rb_held(cb->active_rbuf);
+}
+
+}  // namespace
+
+bool cb_begin_probes(cb_buffer_st* cb, cb_probe_st* saved) {
+    saved->active = 0;
+    const bool sets = cb->cb_read == cb_read_single || cb->cb_read == cb_read_multi;
+    const bool ring = cb->buffer_type == CB_STREAM_RBUF && cb->active_rbuf && cb->base;
+    const bool cache = cb->buffer_type == CB_FS_CACHE && cb->fs_cache.buffer && !cb->active_rbuf;
+    // Unbuffered reads already read what they are asked.
+    if (!sets || !(ring || cache)) return false;
+    saved->active = 1;
+    saved->cb_read = cb->cb_read;
+    saved->cb_peek = cb->cb_peek;
+    saved->cb_seek = cb->cb_seek;
+    saved->cb_seek64 = cb->cb_seek64;
+    saved->buffer_type = cb->buffer_type;
+    saved->curpos = cb->curpos;
+    if (ring) {
+        // The streaming thread reads nothing while the input is the probes';
+        // nothing is stored meanwhile, so the ring's end stays where it is.
+        sys_ringbuffer_source_lock(cb->active_rbuf);
+        sys_ringbuffer_settle(cb->active_rbuf);
+        ring_side_st* s = ring_side(cb);
+        // An input left at the end by a seek from there goes back to the
+        // ring's end with the rest below.
+        saved->input_back = s->input_away ? s->input_back : ring_input_end(cb);
+    }
+    cb->cb_read = probe_read_op;
+    cb->cb_peek = probe_peek_op;
+    cb->cb_seek = probe_seek_op;
+    cb->cb_seek64 = probe_seek64_op;
+    // Parsers read in place only from buffers: none serves the probes.
+    cb->buffer_type = CB_NO_BUF;
+    return true;
+}
+
+void cb_end_probes(cb_buffer_st* cb, const cb_probe_st* saved) {
+    if (!saved->active) return;
+    cb->cb_read = saved->cb_read;
+    cb->cb_peek = saved->cb_peek;
+    cb->cb_seek = saved->cb_seek;
+    cb->cb_seek64 = saved->cb_seek64;
+    cb->buffer_type = saved->buffer_type;
+    cb->curpos = saved->curpos;
+    cb_io_st* in = cb->input;
+    if (cb->buffer_type == CB_FS_CACHE) {
+        // The cache knows where the input stands and moves it when it must.
+        const cb_off_t at = in->tell(in);
+        cache_input_moved(cb, static_cast<cb_fpos>(at < 0 ? 0 : at));
+        return;
+    }
+    sys_ringbuffer* rb = cb->active_rbuf;
+    ring_side_st* s = ring_side(cb);
+    if (in->seek(in, static_cast<cb_off_t>(saved->input_back), CB_SEEK_SET) == -1) {
+        // The input cannot go back: the ring starts over where it stands.
+        const cb_off_t at = in->tell(in);
+        pthread_mutex_lock(&rb->ring_mutex);
+        sys_ringbuffer_reset_locked(rb);
+        if (cb->base) end_hold_locked(cb);
+        pthread_mutex_unlock(&rb->ring_mutex);
+        s->active = s->input_away = 0;
+        cb->curpos = static_cast<cb_fpos>(at < 0 ? 0 : at);
+    } else {
+        s->input_away = 0;
+    }
+    sys_ringbuffer_source_unlock(rb);
+}
