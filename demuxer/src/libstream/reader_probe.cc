@@ -1,35 +1,66 @@
 // Probes: while a search parses a few bytes here and there (the search
 // without index steps back over thousands of packets, reading a header in
-// each), reads go straight to the input and read only what is asked. A
-// buffered read there would fetch a whole block that starts at each packet,
-// to use a few dozen bytes of it. What the buffers hold, where the reader
+// each), reads take what a buffer already holds and read the rest straight
+// from the input, only what is asked. A buffered read there would fetch a
+// whole block that starts at each packet, to use a few dozen bytes of it. What the buffers hold, where the reader
 // stands and where the input stands for them are put back at the end, so
 // delivery afterwards reads as it would have without the probes.
 #include "stream_internal.h"
 
 namespace {
 
-// The input to the probe position; false when it refuses.
-bool input_to_curpos(cb_buffer_st* cb) {
+// Copies what the ring holds from `pos` on (its history behind the read
+// position, and what is held ahead of it), up to `size` bytes. While probes
+// run nothing is consumed or stored, and the read position is in ring_pos.
+size_t ring_copy_held(cb_buffer_st* cb, uint8_t* dst, size_t size, cb_fpos pos) {
+    sys_ringbuffer* rb = cb->active_rbuf;
+    const cb_fpos rp = ring_side(cb)->ring_pos;
+    const uint32_t behind = sys_ringbuffer_history(rb);
+    const uint32_t ahead = rb_held(rb);
+    if (pos + behind < rp || pos >= rp + ahead) return 0;
+    const uint64_t left = rp + ahead - pos;
+    const uint32_t n = static_cast<uint32_t>(left < size ? left : size);
+    // Bytes behind the read position are reached the other way round the storage.
+    const uint32_t skip = pos >= rp ? static_cast<uint32_t>(pos - rp) : rb->size - static_cast<uint32_t>(rp - pos);
+    pthread_mutex_lock(&rb->ring_mutex);
+    (void)sys_ringbuffer_read_peek(rb, dst, n, skip);
+    pthread_mutex_unlock(&rb->ring_mutex);
+    return n;
+}
+
+// What a buffer already holds at `pos`, copied (up to `size` bytes).
+size_t copy_held(cb_buffer_st* cb, uint8_t* dst, size_t size, cb_fpos pos) {
+    if (cb->active_rbuf) {
+        const size_t n = side_copy_held(cb, dst, size, pos);
+        return n ? n : ring_copy_held(cb, dst, size, pos);
+    }
+    return cache_copy_held(cb, dst, size, pos);
+}
+
+// The input to `pos`; false when it refuses.
+bool input_to(cb_buffer_st* cb, cb_fpos pos) {
     cb_io_st* in = cb->input;
-    const cb_off_t at = static_cast<cb_off_t>(cb->curpos);
+    const cb_off_t at = static_cast<cb_off_t>(pos);
     return in->tell(in) == at || in->seek(in, at, CB_SEEK_SET) == at;
 }
 
+// Bytes at curpos from what the buffers hold, the rest straight from the input.
 int32_t probe_read(cb_buffer_st* cb, uint8_t* dst, int32_t size, bool advance) {
     if (size <= 0) {
         cb->cb_errcode = CB_ERR_OK;
         return 0;
     }
     size_t n = 0;
-    if (input_to_curpos(cb)) {
-        if (dst) {
-            n = cb->input->read(cb->input, dst, static_cast<size_t>(size));
-        } else {
-            // A read that keeps nothing is a skip.
-            n = static_cast<size_t>(size);
-            if (!advance) n = 0;
+    if (!dst) {
+        n = advance ? static_cast<size_t>(size) : 0;  // a read that keeps nothing is a skip
+    } else {
+        for (;;) {
+            const size_t k = copy_held(cb, dst + n, static_cast<size_t>(size) - n, cb->curpos + n);
+            n += k;
+            if (k == 0 || n == static_cast<size_t>(size)) break;
         }
+        if (n < static_cast<size_t>(size) && input_to(cb, cb->curpos + n))
+            n += cb->input->read(cb->input, dst + n, static_cast<size_t>(size) - n);
     }
     cb->cb_errcode = n < static_cast<size_t>(size) ? CB_ERR_EOF : CB_ERR_OK;
     if (advance) cb->curpos += n;
@@ -105,6 +136,9 @@ bool cb_begin_probes(cb_buffer_st* cb, cb_probe_st* saved) {
         // An input left at the end by a seek from there goes back to the
         // ring's end with the rest below.
         saved->input_back = s->input_away ? s->input_back : ring_input_end(cb);
+        // Where the ring reads, for the probes to find its bytes (the field
+        // means nothing else outside a visit).
+        if (!s->active) s->ring_pos = cb->curpos;
     }
     cb->cb_read = probe_read_op;
     cb->cb_peek = probe_peek_op;
