@@ -111,6 +111,13 @@ cb_fpos ring_input_end(const cb_buffer_st* cb) {
     return ring_pos + rb_held(cb->active_rbuf);
 }
 
+void set_slots(cb_buffer_st* cb, const cb_probe_st& from) {
+    cb->cb_read = from.cb_read;
+    cb->cb_peek = from.cb_peek;
+    cb->cb_seek = from.cb_seek;
+    cb->cb_seek64 = from.cb_seek64;
+}
+
 }  // namespace
 
 bool cb_begin_probes(cb_buffer_st* cb, cb_probe_st* saved) {
@@ -121,10 +128,8 @@ bool cb_begin_probes(cb_buffer_st* cb, cb_probe_st* saved) {
     // Unbuffered reads already read what they are asked.
     if (!sets || !(ring || cache)) return false;
     saved->active = 1;
-    saved->cb_read = cb->cb_read;
-    saved->cb_peek = cb->cb_peek;
-    saved->cb_seek = cb->cb_seek;
-    saved->cb_seek64 = cb->cb_seek64;
+    saved->cb_read = cb->cb_read, saved->cb_peek = cb->cb_peek;
+    saved->cb_seek = cb->cb_seek, saved->cb_seek64 = cb->cb_seek64;
     saved->buffer_type = cb->buffer_type;
     saved->curpos = cb->curpos;
     if (ring) {
@@ -140,10 +145,10 @@ bool cb_begin_probes(cb_buffer_st* cb, cb_probe_st* saved) {
         // means nothing else outside a visit).
         if (!s->active) s->ring_pos = cb->curpos;
     }
-    cb->cb_read = probe_read_op;
-    cb->cb_peek = probe_peek_op;
-    cb->cb_seek = probe_seek_op;
-    cb->cb_seek64 = probe_seek64_op;
+    cb_probe_st probes{};
+    probes.cb_read = probe_read_op, probes.cb_peek = probe_peek_op;
+    probes.cb_seek = probe_seek_op, probes.cb_seek64 = probe_seek64_op;
+    set_slots(cb, probes);
     // Parsers read in place only from buffers: none serves the probes.
     cb->buffer_type = CB_NO_BUF;
     return true;
@@ -151,10 +156,7 @@ bool cb_begin_probes(cb_buffer_st* cb, cb_probe_st* saved) {
 
 void cb_end_probes(cb_buffer_st* cb, const cb_probe_st* saved) {
     if (!saved->active) return;
-    cb->cb_read = saved->cb_read;
-    cb->cb_peek = saved->cb_peek;
-    cb->cb_seek = saved->cb_seek;
-    cb->cb_seek64 = saved->cb_seek64;
+    set_slots(cb, *saved);
     cb->buffer_type = saved->buffer_type;
     cb->curpos = saved->curpos;
     cb_io_st* in = cb->input;
