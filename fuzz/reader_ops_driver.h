@@ -96,10 +96,18 @@ inline int ops_input(const uint8_t* data, size_t size) {
     }
 
     std::vector<uint8_t> buf(70000);
+    // A search's probes (reads, peeks and seeks only) run between a begin
+    // and an end; anything else ends them first.
+    cb_probe_st probes{};
+    auto end_probes = [&] {
+        cb_end_probes(&r, &probes);
+        probes.active = 0;
+    };
     for (size_t i = 0; i < nops; ++i) {
         const uint8_t op = ops[3 * i];
         const int arg = ops[3 * i + 1] | (ops[3 * i + 2] << 8);
         const int whence = (op >> 4) % 3;
+        if ((op & 7) >= 4 && !((op & 7) == 7 && (arg & 2))) end_probes();
         const cb_fpos before = cb_tell64(&r);
         switch (op & 7) {
             case 0: {
@@ -152,10 +160,12 @@ inline int ops_input(const uint8_t* data, size_t size) {
                 Timer t{"cb_status"};
                 (void)cb_status(&r);
                 (void)cb_tell(&r);
+                if (arg & 2 && !probes.active) (void)cb_begin_probes(&r, &probes);
                 break;
             }
         }
     }
+    end_probes();
     {
         Timer t{"CloseURL"};
         CloseURL(&r, host.table());

@@ -16,6 +16,7 @@ namespace {
 
 using asfb::Bytes;
 using delivery::Player;
+using host::Buffering;
 using host::EventKind;
 constexpr int B = HOVA_SEEK_BACKWARD, F = HOVA_SEEK_FORWARD;
 constexpr hova_stream_type_et kAudio = HOVA_STREAM_AUDIO, kVideo = HOVA_STREAM_VIDEO;
@@ -261,6 +262,34 @@ TEST(IndexSeek, ReadsEachPacketOnceWhateverTheIndexNames) {
             int64_t t = 30000000;
             EXPECT_EQ(seek(p, dir, &t), HOVA_SeekFailed);
             EXPECT_LE(p.input().counters().bytes_read - before, 2 * (c.packets * 1024ull + count * 6ull));
+            p.expect_clean_close();
+        }
+}
+
+// Without an index a backward seek steps back packet by packet from the
+// interpolated start to the key frame (here 900 packets of 1 KiB): in every
+// buffering mode it reads the headers it parses, not a block from each packet
+// it steps back to, and answers as unbuffered. The streaming thread may fill
+// its ring meanwhile.
+TEST(SearchWithoutIndex, ReadsThePacketHeadersNotABlockPerStepInEveryMode) {
+    Clip c;
+    c.packets = 2000, c.key_every = 1000, c.index = false;
+    const Bytes file = build(c);
+    constexpr int kRing = 1 << 18;
+    for (int query : {1, 0})
+        for (Buffering m : host::kBufferings) {
+            SCOPED_TRACE(testing::Message() << host::buffering_name(m) << (query ? ", query" : ""));
+            Player p(file, host::with_buffering(m), kRing);
+            p.open_or_fail();
+            const uint64_t before = p.input().counters().bytes_read;
+            int64_t t = 190000000;
+            ASSERT_EQ(seek(p, B, &t, query), HOVA_OK);
+            EXPECT_EQ(t, 100000000);
+            const uint64_t read = p.input().counters().bytes_read - before;
+            // About 100 bytes of headers a packet; the ring the thread fills
+            // and (applied) the block delivery starts from come on top.
+            const uint64_t bound = file.size() / 8 + (m == Buffering::Thread ? kRing : 0) + (query ? 0 : 32768);
+            EXPECT_LE(read, bound);
             p.expect_clean_close();
         }
 }

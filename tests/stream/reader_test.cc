@@ -17,7 +17,10 @@ using namespace readertest;
 
 TEST(ReaderEquivalence, EveryModeMatchesThePlainFile) {
     // 400 random reads (tiny to several blocks), peeks and seeks of every
-    // origin (near the position, often inside the buffer, or anywhere).
+    // origin (near the position, often inside the buffer, or anywhere), some
+    // of them as a search's probes (bytes from the buffers or straight from
+    // the input, the thread held), after which the reader stands where the
+    // probes began and reads on as if they had not been.
     for (Mode mode : {Mode::None, Mode::Cache, Mode::SyncRing, Mode::Thread}) {
         for (uint32_t seed = 1; seed <= 12; ++seed) {
             std::mt19937 rng(seed);
@@ -27,8 +30,19 @@ TEST(ReaderEquivalence, EveryModeMatchesThePlainFile) {
             Reader r(pattern(size, seed), mode, block, ring);
             ASSERT_EQ(r.open(), 0);
             const uint32_t max_peek = r.ringed() ? ring - block : 3 * block;
-            cb_off_t pos = 0;
+            cb_off_t pos = 0, probe_from = 0;
+            cb_probe_st probes{};
             for (int op = 0; op < 400; ++op) {
+                if (rng() % 25 == 0) {
+                    if (!probes.active) {
+                        probe_from = pos;
+                        ASSERT_EQ(cb_begin_probes(&r.cb, &probes), mode != Mode::None);
+                    } else {
+                        cb_end_probes(&r.cb, &probes);
+                        probes.active = 0;
+                        pos = probe_from;
+                    }
+                }
                 const unsigned kind = rng() % 10;
                 if (kind < 7) {
                     const bool peek = kind >= 5;
@@ -49,7 +63,7 @@ TEST(ReaderEquivalence, EveryModeMatchesThePlainFile) {
                     if (kind == 9 && mode != Mode::Thread) to = size - rng() % 100;
                     const cb_off_t got = kind == 7 ? r.seek(to, CB_SEEK_SET)
                                          : kind == 8 ? r.seek(to - pos, CB_SEEK_CUR)
-                                         : mode != Mode::Thread
+                                         : mode != Mode::Thread || probes.active
                                              ? r.seek(to - size, CB_SEEK_END)
                                              : cb_seek_multi(&r.cb, int32_t(to), CB_SEEK_SET);
                     ASSERT_EQ(got, to) << "seek op " << op;
@@ -57,6 +71,7 @@ TEST(ReaderEquivalence, EveryModeMatchesThePlainFile) {
                 }
                 ASSERT_EQ(cb_tell64(&r.cb), uint64_t(pos)) << "op " << op;
             }
+            cb_end_probes(&r.cb, &probes);
         }
     }
 }

@@ -19,6 +19,23 @@ namespace {
 
 constexpr int kNarrowingProbes = 3;
 
+// The search's reads go straight to the input while it lasts (see
+// cb_begin_probes): it parses a packet header here and there, and a buffered
+// read would fetch a block from each packet it steps back to.
+class ProbeReads {
+public:
+    ProbeReads(cb_buffer_st* cb, bool on) : cb_(cb) {
+        if (on) (void)cb_begin_probes(cb_, &saved_);
+    }
+    ~ProbeReads() { cb_end_probes(cb_, &saved_); }
+    ProbeReads(const ProbeReads&) = delete;
+    ProbeReads& operator=(const ProbeReads&) = delete;
+
+private:
+    cb_buffer_st* cb_;
+    cb_probe_st saved_{};
+};
+
 struct Candidate {
     uint64_t packet = 0;
     int64_t pts = -1;
@@ -61,6 +78,9 @@ uint64_t asf_find_packet_with_type(asf_demuxer_st* d, int dir, int64_t* pts,
     const int64_t target = *pts;
     // Network audio: one positioning and the first object start after it.
     const bool single_probe = d->s.streaming && target_type == HOVA_STREAM_AUDIO;
+    // A network input keeps its buffered reads: each direct read would be a
+    // request of its own.
+    const ProbeReads probes(cb, !d->s.streaming);
     uint64_t lower = 0, upper = d->num_packets;
     int64_t start_time = 0, stop_time = d->s.duration;
     uint64_t curr = 0;

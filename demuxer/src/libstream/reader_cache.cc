@@ -189,6 +189,21 @@ bool cache_holds(const cb_buffer_st* cb, cb_fpos pos) {
     return false;
 }
 
+size_t cache_copy_held(const cb_buffer_st* cb, uint8_t* dst, size_t size, cb_fpos pos) {
+    const cache_slots_st* s = slots_of(cb);
+    for (uint32_t i = 0; i < s->count; ++i) {
+        const bool active = i == s->active;
+        const cb_fpos base = active ? cb->fs_cache.base_pos : s->slot[i].base_pos;
+        const uint32_t avail = active ? cb->fs_cache.avail_size : s->slot[i].avail;
+        if (pos < base || pos >= base + avail) continue;
+        const size_t off = static_cast<size_t>(pos - base);
+        const size_t n = avail - off < size ? avail - off : size;
+        memcpy(dst, slot_memory(cb, i) + off, n);
+        return n;
+    }
+    return 0;
+}
+
 size_t read_fs_cache(cb_buffer_st* cb, uint8_t* dst, size_t size, cb_fpos pos) {
     size_t done = 0;
     for (;;) {

@@ -159,6 +159,15 @@ ring_side_st* ring_side(const cb_buffer_st* cb) { return reinterpret_cast<ring_s
 
 bool side_active(const cb_buffer_st* cb) { return cb->base && cb->active_rbuf && ring_side(cb)->active; }
 
+size_t side_copy_held(const cb_buffer_st* cb, uint8_t* dst, size_t size, cb_fpos pos) {
+    const ring_side_st* s = ring_side(cb);
+    if (!s->valid || pos < s->side_pos || pos >= side_end(s)) return 0;
+    const uint64_t left = side_end(s) - pos;
+    const size_t n = left < size ? static_cast<size_t>(left) : size;
+    memcpy(dst, side_memory(cb) + (pos - s->side_pos), n);
+    return n;
+}
+
 int32_t side_read(cb_buffer_st* cb, uint8_t* dst, int32_t size, bool* more) {
     ring_side_st* s = ring_side(cb);
     *more = false;

@@ -57,6 +57,9 @@ void reset_fs_cache(cb_buffer_st* cb, cb_fpos input_pos);
 // The input was moved to `input_pos`; what the slots hold stays valid.
 void cache_input_moved(cb_buffer_st* cb, cb_fpos input_pos);
 bool cache_holds(const cb_buffer_st* cb, cb_fpos pos);
+// Copies what a slot holds from `pos` on (up to `size` bytes) without making
+// it the slot in use; 0 when none holds `pos`.
+size_t cache_copy_held(const cb_buffer_st* cb, uint8_t* dst, size_t size, cb_fpos pos);
 size_t read_fs_cache(cb_buffer_st* cb, uint8_t* dst, size_t size, cb_fpos pos);
 int32_t peek_fs_cache(cb_buffer_st* cb, uint8_t* dst, int32_t size);
 
@@ -103,6 +106,9 @@ struct ring_side_st {
 };
 ring_side_st* ring_side(const cb_buffer_st* cb);
 bool side_active(const cb_buffer_st* cb);
+// Copies what the side block holds from `pos` on (up to `size` bytes); 0 when
+// it holds nothing there.
+size_t side_copy_held(const cb_buffer_st* cb, uint8_t* dst, size_t size, cb_fpos pos);
 // Serves a read from the side block; *more when the rest is to come from the
 // ring (the visit has ended at the block's end).
 int32_t side_read(cb_buffer_st* cb, uint8_t* dst, int32_t size, bool* more);

@@ -37,6 +37,25 @@ cb_fpos cb_get_file_size(cb_buffer_st* cbuf);
  * a parser may read them in place, then move on with cb_seek64 from the
  * current position. Valid until the next call on the reader. */
 uint32_t cb_ring_span(cb_buffer_st* cbuf, const uint8_t** at);
+/* Probes: from cb_begin_probes to cb_end_probes the reader's slots read,
+ * peek and seek straight on the input, reading only the bytes asked, and
+ * parsers see no buffer to read in place from; the buffers keep what they
+ * hold, and the end puts back the position, the slots and the input (with a
+ * streaming thread, which reads nothing meanwhile). For searches that parse a
+ * few bytes in many places. Begin returns false (and end does nothing) when
+ * the reader is unbuffered already or not one that can lend its input. */
+struct cb_probe_st {
+    int active;
+    int32_t (*cb_read)(cb_buffer_st*, uint8_t*, int32_t);
+    int32_t (*cb_peek)(cb_buffer_st*, uint8_t*, int32_t);
+    int32_t (*cb_seek)(cb_buffer_st*, int32_t, int);
+    cb_off_t (*cb_seek64)(cb_buffer_st*, cb_off_t, int);
+    CB_BufferType buffer_type;
+    cb_fpos curpos;
+    cb_fpos input_back; /* ring: where its producer goes on reading */
+};
+bool cb_begin_probes(cb_buffer_st* cbuf, cb_probe_st* saved);
+void cb_end_probes(cb_buffer_st* cbuf, const cb_probe_st* saved);
 /* Non-zero installs the multi-thread set, zero the single-thread set. */
 void changeThreadType(cb_buffer_st* cbuf, int useRingBuf);
 
